@@ -1,0 +1,150 @@
+// printf-style formatting of host log and debug lines. The host's %S is a
+// UTF-16 string, which the C library's formatter cannot take on Linux, so
+// each conversion is formatted on its own.
+#include <cstdio>
+#include <cstring>
+
+#include "simHost.h"
+
+namespace sim {
+
+std::string utf16ToUtf8(const char16_t* text, size_t length)
+{
+    std::string out;
+    for (size_t i = 0; i < length; ++i) {
+        uint32_t c = text[i];
+        if (c >= 0xD800 && c <= 0xDBFF && i + 1 < length && text[i + 1] >= 0xDC00 && text[i + 1] <= 0xDFFF) {
+            c = 0x10000 + ((c - 0xD800) << 10) + (text[i + 1] - 0xDC00);
+            ++i;
+        }
+        if (c < 0x80) {
+            out += static_cast<char>(c);
+        } else if (c < 0x800) {
+            out += static_cast<char>(0xC0 | (c >> 6));
+            out += static_cast<char>(0x80 | (c & 0x3F));
+        } else if (c < 0x10000) {
+            out += static_cast<char>(0xE0 | (c >> 12));
+            out += static_cast<char>(0x80 | ((c >> 6) & 0x3F));
+            out += static_cast<char>(0x80 | (c & 0x3F));
+        } else {
+            out += static_cast<char>(0xF0 | (c >> 18));
+            out += static_cast<char>(0x80 | ((c >> 12) & 0x3F));
+            out += static_cast<char>(0x80 | ((c >> 6) & 0x3F));
+            out += static_cast<char>(0x80 | (c & 0x3F));
+        }
+    }
+    return out;
+}
+
+std::string utf16ToUtf8(const char16_t* text)
+{
+    if (text == nullptr) return "(null)";
+    size_t length = 0;
+    while (text[length] != 0) ++length;
+    return utf16ToUtf8(text, length);
+}
+
+std::u16string utf8ToUtf16(const std::string& text)
+{
+    std::u16string out;
+    for (size_t i = 0; i < text.size();) {
+        uint32_t c = static_cast<unsigned char>(text[i]);
+        size_t extra = c >= 0xF0 ? 3 : c >= 0xE0 ? 2 : c >= 0xC0 ? 1 : 0;
+        if (extra) c &= 0x3F >> extra;
+        ++i;
+        for (size_t k = 0; k < extra && i < text.size(); ++k, ++i) c = (c << 6) | (text[i] & 0x3F);
+        if (c >= 0x10000) {
+            c -= 0x10000;
+            out += static_cast<char16_t>(0xD800 + (c >> 10));
+            out += static_cast<char16_t>(0xDC00 + (c & 0x3FF));
+        } else {
+            out += static_cast<char16_t>(c);
+        }
+    }
+    return out;
+}
+
+std::string formatHostMessage(const char* format, va_list arguments)
+{
+    std::string out;
+    char piece[512];
+    for (const char* p = format; *p != 0;) {
+        if (*p != '%') {
+            out += *p++;
+            continue;
+        }
+        const char* start = p++;
+        if (*p == '%') {
+            out += '%';
+            ++p;
+            continue;
+        }
+        while (*p != 0 && std::strchr("-+ #0", *p)) ++p;
+        while ((*p >= '0' && *p <= '9') || *p == '.') ++p;
+        int longs = 0;
+        bool half = false;
+        bool size = false;
+        while (*p == 'l' || *p == 'h' || *p == 'z' || *p == 'I') {
+            if (*p == 'l') ++longs;
+            if (*p == 'h') half = true;
+            if (*p == 'z') size = true;
+            ++p;
+        }
+        char conversion = *p;
+        if (conversion == 0) break;
+        ++p;
+        std::string spec(start, p);
+        switch (conversion) {
+        case 'd':
+        case 'i':
+            if (longs >= 2 || size) {
+                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, long long));
+            } else if (longs == 1) {
+                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, long));
+            } else {
+                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, int));
+            }
+            out += piece;
+            break;
+        case 'u':
+        case 'x':
+        case 'X':
+        case 'o':
+            if (longs >= 2 || size) {
+                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, unsigned long long));
+            } else if (longs == 1) {
+                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, unsigned long));
+            } else {
+                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, unsigned));
+            }
+            out += piece;
+            break;
+        case 'c':
+            std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, int));
+            out += piece;
+            break;
+        case 'p':
+            std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, void*));
+            out += piece;
+            break;
+        case 's': {
+            const char* text = va_arg(arguments, const char*);
+            if (longs == 1) {
+                out += utf16ToUtf8(reinterpret_cast<const char16_t*>(text));
+            } else {
+                out += text == nullptr ? "(null)" : text;
+            }
+            break;
+        }
+        case 'S':
+            out += utf16ToUtf8(va_arg(arguments, const char16_t*));
+            break;
+        default:
+            out += spec;  // unknown conversion: shown as written
+            (void)half;
+        }
+    }
+    return out;
+}
+
+}  // namespace sim

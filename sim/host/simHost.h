@@ -1,0 +1,207 @@
+// The host stand-in: what karvelk.sys provides to the module, and the controls
+// tests and the lab use to set the world up and see what happened.
+#pragma once
+
+#include <cstdarg>
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <map>
+#include <memory>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "../../host/deviceTree.h"
+#include "../../host/karvelk.h"
+#include "../../host/moduleRecords.h"
+
+namespace sim {
+
+// Failure statuses the stand-in reports; distinct so tests can tell them apart.
+constexpr tStatus kHostFailure = -52000;          // an operation told to fail
+constexpr tStatus kHostAllocationFailed = -52001;
+constexpr tStatus kHostTransferStalled = -52002;  // the device refused a request
+constexpr tStatus kHostDeviceGone = -52003;       // unplugged, or a stale stream
+constexpr tStatus kHostBadArgument = -52004;
+
+struct LogEntry {
+    std::string component;
+    std::string location;
+    uint32_t level = 0;
+    std::string tag;
+    std::string format;
+    std::string message;  // formatted
+};
+
+struct PackageEvent {
+    uint32_t event = 0;
+    std::string firstName;
+    std::string secondName;
+    std::string mainName;
+    tModuleMain moduleMain = nullptr;
+};
+
+// Counts live blocks; can be told to fail the Nth allocation from now on, or all.
+class Allocator {
+public:
+    void* allocate(size_t size, tStatus* status);
+    void release(void* pointer);
+
+    size_t liveBlocks() const { return live_.size(); }
+    size_t liveBytes() const;
+    size_t totalAllocations() const { return total_; }
+    void failNth(size_t nth);  // 1 = the next allocation
+    void failAll(bool fail) { failAll_ = fail; }
+    void clearFaults();
+    void reset();
+
+private:
+    std::map<void*, size_t> live_;
+    size_t total_ = 0;
+    size_t attempts_ = 0;
+    std::set<size_t> failAt_;
+    bool failAll_ = false;
+};
+
+class UsbDeviceSim;
+
+// Which operations of the tree fail. Call numbers count from 1.
+struct TreeFaults {
+    bool createQuery = false;
+    bool setAttribute = false;
+    bool findDevices = false;
+    std::set<int> addListenerCalls;
+    bool removeListener = false;
+};
+
+class DeviceTreeSim : public iDeviceTree {
+public:
+    DeviceTreeSim();
+    ~DeviceTreeSim();
+
+    void addListener(ListenerRecord* record, tStatus& status) override;
+    void releaseQuery(DeviceQuery** query) override;
+    void removeListener(ListenerRecord* record, tStatus* status) override;
+    DeviceQuery* createQuery() override;
+    void findDevices(DeviceList* list, uint32_t selector, DeviceQuery* query, uint32_t flags,
+                     tStatus& status) override;
+
+    TreeFaults faults;
+
+    // Adds a device. Once listeners exist its arrival is delivered at once
+    // (the caller is the host's own thread, outside any module call).
+    UsbDeviceSim& plugIn(std::unique_ptr<UsbDeviceSim> device);
+    void unplug(UsbDeviceSim& device);
+
+    // Devices announce arrivals and removals here; they are delivered by
+    // deliverPendingEvents(), never from inside the call that caused them.
+    void queueArrival(UsbDeviceSim& device);
+    void queueRemoval(UsbDeviceSim& device);
+    void adopt(std::unique_ptr<UsbDeviceSim> device);  // kept alive, not yet present
+    void deliverPendingEvents();
+
+    std::vector<UsbDeviceSim*> presentDevices() const;
+    std::vector<UsbDeviceSim*> allDevices() const;
+    size_t liveQueries() const;
+    size_t liveListeners() const { return listeners_.size(); }
+    int addListenerCalls() const { return addListenerCalls_; }
+    int removeListenerCalls() const { return removeListenerCalls_; }
+    std::vector<std::string> describeLeftovers() const;
+
+private:
+    struct Event {
+        bool arrival;
+        UsbDeviceSim* device;
+    };
+    class Query;
+    void deliver(const Event& event);
+
+    std::vector<std::unique_ptr<UsbDeviceSim>> devices_;
+    std::vector<std::unique_ptr<Query>> queries_;
+    std::vector<ListenerRecord*> listeners_;
+    std::deque<Event> pending_;
+    uint32_t nextQueryId_ = 0x51;
+    int addListenerCalls_ = 0;
+    int removeListenerCalls_ = 0;
+    bool delivering_ = false;
+};
+
+// A USB device as the host presents it: attributes, a descriptor, and (for
+// the emulated loader) control streams.
+class UsbDeviceSim : public UsbDevice {
+public:
+    UsbDeviceSim(uint32_t vendorId, uint32_t productId, uint32_t attribute21 = 0);
+    virtual ~UsbDeviceSim();
+
+    uint32_t getAttribute(uint32_t id, tStatus* status) override;
+    ControlStream* openStream(nQVKORD100::tControlStreamParameterUSB* parameter, tStatus& status) override;
+    void closeStream(ControlStream* stream, tStatus& status) override;
+    void getDescriptor(nQVKORD100::tUSBDeviceDescriptorProxy* proxy, tStatus& status) override;
+
+    std::string name;
+    bool present = false;
+    std::map<uint32_t, uint32_t> attributes;
+    std::set<uint32_t> failingAttributes;
+    bool failDescriptor = false;
+    int descriptorReads = 0;
+    int attributeReads = 0;
+
+    // Open control streams of this device (the emulated loader has some).
+    virtual size_t openStreams() const { return 0; }
+    virtual std::string describe() const;
+
+    DeviceTreeSim* tree = nullptr;  // set when the tree takes the device
+};
+
+class Host {
+public:
+    static Host& get();
+
+    // A fresh world: new tree, nothing allocated, logged or registered.
+    void reset();
+
+    bool ready = true;
+    Allocator allocator;
+    std::vector<LogEntry> eventLog;
+    std::vector<std::string> debugLines;
+    std::vector<PackageEvent> packageEvents;
+
+    // Registration.
+    _tLibModuleInfo* registeredModule = nullptr;
+    int registrations = 0;
+    int unregistrations = 0;
+    tStatus registrationFailure = 0;    // negative: libRegisterModuleWithKARVEL fails with it
+    tStatus unregistrationFailure = 0;  // negative: libUnregisterModuleWithKARVEL fails with it
+    std::vector<std::string> registrationProblems;  // what was wrong with the records
+
+    // Calls the module main through the registered record, as the host does,
+    // then delivers the device events that the call caused.
+    tStatus callModuleMain(uint32_t reason);
+
+    // The device tree; null when the host has none.
+    DeviceTreeSim* tree() { return tree_.get(); }
+    void setTreePresent(bool present);
+
+    // Misuse of the host's interfaces by the module, reported loudly.
+    void reportMisuse(const std::string& what);
+    std::vector<std::string> misuse;
+
+    // Live allocations, listeners, queries and streams, described; empty
+    // when nothing was left behind.
+    std::vector<std::string> leftovers() const;
+
+private:
+    Host();
+    std::unique_ptr<DeviceTreeSim> tree_;
+    bool treePresent_ = true;
+};
+
+// printf-style formatting as the host does it: %S takes a UTF-16 string.
+std::string formatHostMessage(const char* format, va_list arguments);
+std::string utf16ToUtf8(const char16_t* text);
+std::string utf16ToUtf8(const char16_t* text, size_t length);
+std::u16string utf8ToUtf16(const std::string& text);
+
+}  // namespace sim

@@ -1,0 +1,23 @@
+// The names the kernel and the host's loader wrappers call.
+#pragma once
+
+#include <stdint.h>
+
+#include "../../../host/karvelkStatus.h"
+#include "../../../kernel/ntkernel.h"
+
+// On Windows the exports are named in the driver's .def file; on Linux the
+// names must be visible for the version script to export them.
+#if defined(_WIN32)
+#define MODULE_EXPORT
+#else
+#define MODULE_EXPORT __attribute__((visibility("default")))
+#endif
+
+extern "C" {
+MODULE_EXPORT NTSTATUS DllInitialize(UNICODE_STRING* registryPath);
+MODULE_EXPORT NTSTATUS DllUnload();
+MODULE_EXPORT const uint8_t* pkgSetWDMWrapperLoadStateAndGetGUID(uint32_t state);
+MODULE_EXPORT tStatus pkgWDMWrapperCallSSMain(uint32_t reason);
+MODULE_EXPORT void pkgSetLegacyWrapperLoadState(uint32_t state);
+}
