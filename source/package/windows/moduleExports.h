@@ -5,14 +5,8 @@
 
 #include "../../../host/karvelkStatus.h"
 #include "../../../kernel/ntkernel.h"
+#include "../../exportVisibility.h"
 
-// On Windows the exports are named in the driver's .def file; on Linux the
-// names must be visible for the version script to export them.
-#if defined(_WIN32)
-#define MODULE_EXPORT
-#else
-#define MODULE_EXPORT __attribute__((visibility("default")))
-#endif
 
 extern "C" {
 MODULE_EXPORT NTSTATUS DllInitialize(UNICODE_STRING* registryPath);
