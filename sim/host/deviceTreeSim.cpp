@@ -43,8 +43,8 @@ DeviceTreeSim::~DeviceTreeSim() = default;
 
 void DeviceTreeSim::addListener(ListenerRecord* record, tStatus& status)
 {
-    if (status < 0) return;
     ++addListenerCalls_;
+    if (status < 0) return;
     if (faults.addListenerCalls.count(addListenerCalls_) != 0) {
         setFailure(status, kHostFailure);
         return;
@@ -233,5 +233,6 @@ std::vector<std::string> DeviceTreeSim::describeLeftovers() const
 
 iDeviceTree* iDeviceTree::getDeviceTree()
 {
-    return sim::Host::get().tree();
+    sim::Host& host = sim::Host::get();
+    return host.treePresent() ? host.tree() : nullptr;
 }

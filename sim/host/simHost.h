@@ -147,6 +147,7 @@ public:
     bool failDescriptor = false;
     int descriptorReads = 0;
     int attributeReads = 0;
+    int streamOpenAttempts = 0;  // a plain device: how often the module tried to talk to it
 
     // Open control streams of this device (the emulated loader has some).
     virtual size_t openStreams() const { return 0; }
@@ -180,9 +181,11 @@ public:
     // then delivers the device events that the call caused.
     tStatus callModuleMain(uint32_t reason);
 
-    // The device tree; null when the host has none.
+    // The device tree the tests drive. Whether the module can get it is
+    // setTreePresent's to say.
     DeviceTreeSim* tree() { return tree_.get(); }
     void setTreePresent(bool present);
+    bool treePresent() const { return treePresent_; }
 
     // Misuse of the host's interfaces by the module, reported loudly.
     void reportMisuse(const std::string& what);

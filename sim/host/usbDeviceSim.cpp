@@ -28,7 +28,9 @@ uint32_t UsbDeviceSim::getAttribute(uint32_t id, tStatus* status)
 ControlStream* UsbDeviceSim::openStream(nQVKORD100::tControlStreamParameterUSB*, tStatus& status)
 {
     // A plain USB device has no loader to talk to.
-    if (status >= 0) setFailure(status, kHostFailure);
+    if (status < 0) return nullptr;
+    ++streamOpenAttempts;
+    setFailure(status, kHostFailure);
     return nullptr;
 }
 

@@ -1,0 +1,198 @@
+// The device table: its construction and every way it can fail part way, the
+// walk over present devices, hot-plug, and the arrival filter's decisions.
+#include "tests/support/ModuleTest.h"
+
+namespace {
+
+class DeviceTable : public testing_support::ModuleTest {
+protected:
+    void SetUp() override
+    {
+        ModuleTest::SetUp();
+        load();
+    }
+    void TearDown() override
+    {
+        if (module != nullptr) {
+            EXPECT_EQ(callSsMain(1), 0);
+            EXPECT_EQ(module->dllUnload(), 0);
+        }
+        ModuleTest::TearDown();
+    }
+};
+
+TEST_F(DeviceTable, AnEmptyTreeStillRegistersBothListeners)
+{
+    EXPECT_EQ(callSsMain(0), 0);
+    EXPECT_EQ(tree().liveListeners(), 2u);
+    EXPECT_EQ(tree().addListenerCalls(), 2);
+}
+
+struct ConstructionFailure {
+    const char* name;
+    std::function<void(sim::Host&)> arrange;
+    tStatus expected;
+    int addListenerCalls;
+    int removeListenerCalls;
+};
+
+void PrintTo(const ConstructionFailure& failure, std::ostream* out)
+{
+    *out << failure.name;
+}
+
+class ConstructionFailures : public DeviceTable, public ::testing::WithParamInterface<ConstructionFailure> {};
+
+// Whatever step fails, the start fails with its status, nothing stays
+// registered or allocated, and the module can start again afterwards.
+TEST_P(ConstructionFailures, LeaveNothingBehind)
+{
+    const ConstructionFailure& failure = GetParam();
+    sim::UsbDeviceSim& device = addDevice(0x5C1D, 0x4A10);
+    failure.arrange(host());
+    EXPECT_EQ(callSsMain(0), failure.expected);
+    EXPECT_EQ(tree().liveListeners(), 0u);
+    EXPECT_EQ(tree().liveQueries(), 0u);
+    EXPECT_EQ(tree().addListenerCalls(), failure.addListenerCalls);
+    EXPECT_EQ(tree().removeListenerCalls(), failure.removeListenerCalls);
+    EXPECT_EQ(host().allocator.liveBlocks(), 1u) << "only the static stop node stays";
+    (void)device;
+
+    host().allocator.clearFaults();
+    host().setTreePresent(true);
+    tree().faults = sim::TreeFaults{};
+    EXPECT_EQ(callSsMain(1), 0);
+    EXPECT_EQ(callSsMain(0), 0);
+    EXPECT_EQ(tree().liveListeners(), 2u);
+}
+
+// Allocations of a start: 1 the table, 2 the search's array, 3 the arrival
+// record, 4 the removal record.
+const ConstructionFailure kConstructionFailures[] = {
+    {"NoDeviceTree", [](sim::Host& h) { h.setTreePresent(false); }, -50150, 0, 0},
+    {"NoQuery", [](sim::Host& h) { h.tree()->faults.createQuery = true; }, -50352, 0, 0},
+    {"QueryAttributeFails", [](sim::Host& h) { h.tree()->faults.setAttribute = true; }, sim::kHostFailure, 0, 0},
+    {"SearchFails", [](sim::Host& h) { h.tree()->faults.findDevices = true; }, sim::kHostFailure, 0, 0},
+    {"SearchArrayNotAllocated", [](sim::Host& h) { h.allocator.failNth(2); }, sim::kHostAllocationFailed, 0, 0},
+    {"NoArrivalRecord", [](sim::Host& h) { h.allocator.failNth(3); }, -50352, 0, 1},
+    {"NoRemovalRecord", [](sim::Host& h) { h.allocator.failNth(4); }, -50352, 0, 1},
+    {"NoRecords", [](sim::Host& h) {
+         h.allocator.failNth(3);
+         h.allocator.failNth(4);
+     }, -50352, 0, 0},
+    {"FirstAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListenerCalls = {1}; }, sim::kHostFailure, 2, 2},
+    {"SecondAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListenerCalls = {2}; }, sim::kHostFailure, 2, 2},
+};
+
+INSTANTIATE_TEST_SUITE_P(Steps, ConstructionFailures, ::testing::ValuesIn(kConstructionFailures),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(DeviceTable, PresentDevicesAreHandledBeforeAnyListenerExists)
+{
+    sim::UsbDeviceSim& first = addDevice(0x5C1D, 0x4A10);
+    sim::UsbDeviceSim& second = addDevice(0x5C1D, 0x4A20);
+    tree().faults.addListenerCalls = {1};  // the walk must not depend on the listeners
+    EXPECT_EQ(callSsMain(0), sim::kHostFailure);
+    EXPECT_EQ(first.streamOpenAttempts, 1);
+    EXPECT_EQ(second.streamOpenAttempts, 1);
+}
+
+TEST_F(DeviceTable, OneDevicesFailureNeitherStopsTheWalkNorTheTable)
+{
+    sim::UsbDeviceSim& failing = addDevice(0x5C1D, 0x4A10);
+    failing.failDescriptor = true;
+    sim::UsbDeviceSim& next = addDevice(0x5C1D, 0x4A10);
+    EXPECT_EQ(callSsMain(0), 0);
+    EXPECT_EQ(failing.streamOpenAttempts, 0);
+    EXPECT_EQ(next.streamOpenAttempts, 1);
+    EXPECT_TRUE(host().eventLog.empty());
+}
+
+struct FilterCase {
+    const char* name;
+    uint32_t vendorId;
+    uint32_t productId;
+    uint32_t attribute21;
+    bool updated;
+    int descriptorReads;
+};
+
+void PrintTo(const FilterCase& c, std::ostream* out)
+{
+    *out << c.name;
+}
+
+class ArrivalFilter : public DeviceTable, public ::testing::WithParamInterface<FilterCase> {};
+
+TEST_P(ArrivalFilter, DecidesForPresentAndArrivingDevices)
+{
+    const FilterCase& c = GetParam();
+    sim::UsbDeviceSim& present = addDevice(c.vendorId, c.productId, c.attribute21);
+    ASSERT_EQ(callSsMain(0), 0);
+    EXPECT_EQ(present.streamOpenAttempts, c.updated ? 1 : 0);
+    EXPECT_EQ(present.descriptorReads, c.descriptorReads);
+
+    sim::UsbDeviceSim& arriving = tree().plugIn(std::make_unique<sim::UsbDeviceSim>(c.vendorId, c.productId, c.attribute21));
+    EXPECT_EQ(arriving.streamOpenAttempts, c.updated ? 1 : 0);
+    EXPECT_EQ(arriving.descriptorReads, c.descriptorReads);
+    EXPECT_TRUE(host().eventLog.empty()) << "the filter logs nothing";
+}
+
+const FilterCase kFilterCases[] = {
+    {"SmallLoader", 0x5C1D, 0x4A10, 0, true, 1},
+    {"LargeLoader", 0x5C1D, 0x4A20, 0, true, 1},
+    {"VendorUpperBitsIgnored", 0xABCD5C1D, 0x4A10, 0, true, 1},
+    {"ProductUpperBitsIgnored", 0x5C1D, 0x00014A20, 0, true, 1},
+    {"AlmostBarred", 0x5C1D, 0x4A10, 0xFFFFFFFE, true, 1},
+    {"Barred", 0x5C1D, 0x4A10, 0xFFFFFFFF, false, 1},
+    {"OtherProductOfTheFamily", 0x5C1D, 0x4B01, 0, false, 0},
+    {"NeighbourProductId", 0x5C1D, 0x4A11, 0, false, 0},
+    {"OtherVendor", 0x1234, 0x4A10, 0, false, 0},
+};
+
+INSTANTIATE_TEST_SUITE_P(Devices, ArrivalFilter, ::testing::ValuesIn(kFilterCases),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(DeviceTable, AFailingAttributeReadMeansNoUpdate)
+{
+    for (uint32_t attribute : {1u, 2u}) {
+        sim::UsbDeviceSim& device = addDevice(0x5C1D, 0x4A10);
+        device.failingAttributes.insert(attribute);
+        // Both IDs are read whatever the first read left.
+        (void)device;
+    }
+    ASSERT_EQ(callSsMain(0), 0);
+    for (sim::UsbDeviceSim* device : tree().presentDevices()) {
+        EXPECT_EQ(device->streamOpenAttempts, 0);
+        EXPECT_EQ(device->attributeReads, device->failingAttributes.count(1) ? 1 : 2);
+    }
+}
+
+TEST_F(DeviceTable, AFailedDescriptorReadMeansNoUpdate)
+{
+    sim::UsbDeviceSim& device = addDevice(0x5C1D, 0x4A10);
+    device.failDescriptor = true;
+    ASSERT_EQ(callSsMain(0), 0);
+    EXPECT_EQ(device.streamOpenAttempts, 0);
+}
+
+TEST_F(DeviceTable, RemovalsChangeNothing)
+{
+    sim::UsbDeviceSim& device = addDevice(0x5C1D, 0x4A10);
+    ASSERT_EQ(callSsMain(0), 0);
+    size_t blocks = host().allocator.liveBlocks();
+    tree().unplug(device);
+    EXPECT_EQ(host().allocator.liveBlocks(), blocks);
+    EXPECT_EQ(tree().liveListeners(), 2u);
+    EXPECT_TRUE(host().eventLog.empty());
+}
+
+TEST_F(DeviceTable, NoCallbackAfterTheStop)
+{
+    ASSERT_EQ(callSsMain(0), 0);
+    ASSERT_EQ(callSsMain(1), 0);
+    sim::UsbDeviceSim& late = tree().plugIn(std::make_unique<sim::UsbDeviceSim>(0x5C1D, 0x4A10, 0));
+    EXPECT_EQ(late.streamOpenAttempts, 0);
+}
+
+}  // namespace
