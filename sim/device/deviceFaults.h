@@ -1,0 +1,34 @@
+// What an emulated device is told to get wrong.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <set>
+#include <vector>
+
+namespace sim {
+
+// The loader's requests, told apart by bmRequestType and bRequest.
+enum class RequestKind { Read, Write, Erase, Restart, Unknown };
+
+// A flash cell that reads back wrong: the stored byte is untouched, only the
+// data of memory reads covering it is altered.
+struct ReadCorruption {
+    uint16_t address = 0;
+    uint8_t xorMask = 0;
+    std::optional<uint8_t> replacement;  // when set, read back instead of the stored byte
+};
+
+struct DeviceFaults {
+    // Request numbers count every request the device is handed, from 1.
+    std::set<uint64_t> stallRequests;
+    std::set<RequestKind> stallKinds;
+    std::vector<ReadCorruption> readCorruptions;
+    // From this request on the device no longer answers and leaves the tree;
+    // its flash stays as it was. 0: never.
+    uint64_t unplugAtRequest = 0;
+    bool refuseOpenStream = false;
+    bool refuseAllocateBuffer = false;
+};
+
+}  // namespace sim

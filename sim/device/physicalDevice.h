@@ -1,0 +1,127 @@
+// One emulated device of the family as a piece of hardware: its flash, the
+// faults it is told to have, the trace of what it was asked, its virtual clock.
+// Each time it enumerates, a new UsbDeviceSim stands for it in the host's tree
+// (LoaderModeDevice in loader mode, ProductDevice once its firmware runs); all
+// of them share this one object.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "../host/simHost.h"
+#include "deviceFaults.h"
+#include "flashMemory.h"
+#include "requestTrace.h"
+#include "timingModel.h"
+
+namespace sim {
+
+class EnumeratedDevice;
+class LoaderModeDevice;
+
+constexpr uint16_t kDeviceFamilyVendorId = 0x5C1D;
+
+// Where a loader keeps the firmware and the identity block, by the product ID it enumerates with.
+struct LoaderFlashLayout {
+    uint16_t loaderProductId;
+    uint16_t firmwareBase;
+    uint16_t identityPage;
+};
+const LoaderFlashLayout* findLoaderFlashLayout(uint16_t loaderProductId);  // null: no such loader
+
+// The identity block's fields in host order; in flash each is big-endian.
+struct IdentityValues {
+    uint16_t vendorId = kDeviceFamilyVendorId;
+    uint16_t productId = 0xFFFF;
+    uint32_t serialNumber = 0xFFFFFFFF;
+    uint16_t productIdCopy = 0xFFFF;
+    uint16_t altProductId = 0xFFFF;
+};
+
+struct MemoryBytes {
+    uint16_t address = 0;
+    std::vector<uint8_t> bytes;
+};
+
+struct EmulatedDeviceOptions {
+    std::string name;
+    uint16_t loaderProductId = 0x4A10;
+    uint16_t vendorId = kDeviceFamilyVendorId;  // the loader's own, not the identity block's
+    uint32_t attribute21 = 0;
+    // Initial flash, over a blank part: the identity block, an image already
+    // installed at the firmware base, then any further bytes, in that order.
+    std::optional<IdentityValues> identity;
+    std::vector<uint8_t> image;
+    std::vector<MemoryBytes> memory;
+    DeviceFaults faults;
+    std::optional<TimingModel> timing;
+    bool trace = true;
+    int maxLoaderComebacks = 3;  // restarts in a row that come back in loader mode and are announced
+};
+
+class PhysicalDevice : public std::enable_shared_from_this<PhysicalDevice> {
+public:
+    explicit PhysicalDevice(const EmulatedDeviceOptions& options);
+
+    FlashMemory flash;
+    DeviceFaults faults;
+    std::optional<TimingModel> timing;
+    bool traceEnabled = true;
+    std::vector<RequestRecord> trace;
+    std::chrono::microseconds elapsed{0};  // virtual time spent on requests
+    std::vector<std::string> notes;         // what the lab may want to show; not errors
+
+    const EmulatedDeviceOptions& options() const { return options_; }
+    const LoaderFlashLayout* layout() const { return findLoaderFlashLayout(options_.loaderProductId); }
+    uint64_t requestCount() const { return requests_; }
+    int loaderComebacks() const { return loaderComebacks_; }
+    bool unplugged() const { return unplugged_; }
+    // The enumeration that currently stands for the device, or null when it is unplugged.
+    EnumeratedDevice* current() const { return current_; }
+
+    // Flash helpers for tests and scenarios; they need the loader's flash layout.
+    void setIdentity(const IdentityValues& identity);
+    IdentityValues identity() const;
+    void loadImage(const std::vector<uint8_t>& image);
+    std::vector<uint8_t> readMemory(uint16_t address, size_t count) const { return flash.read(address, count); }
+    bool completionMarkerInPlace() const;
+
+    // Comes into the tree in loader mode and is announced; resets the unplug
+    // fault and the count of loader-mode comebacks.
+    LoaderModeDevice& plugIn(DeviceTreeSim& tree);
+    // Pulled out: the current enumeration is gone and its removal delivered.
+    void unplug();
+
+    // Called by the loader-mode enumeration's streams. refusal is the host's
+    // verdict before the device sees the request (0 when it passes); the
+    // result is the transfer's outcome.
+    tStatus serve(nQVKORD100::tTransferParameterUSBControl& request, tStatus refusal);
+
+    // Called by an enumeration as it is made and destroyed. Only one is live
+    // at a time: one made while another stands for the device starts gone.
+    void attach(EnumeratedDevice& enumeration);
+    void forget(const EnumeratedDevice& enumeration);
+
+private:
+    tStatus carryOut(nQVKORD100::tTransferParameterUSBControl& request, RequestRecord& record);
+    void leaveLoaderMode();
+    void disconnect();  // the current enumeration leaves the tree
+    DeviceTreeSim& treeOf(const EnumeratedDevice& enumeration) const;
+
+    EmulatedDeviceOptions options_;
+    EnumeratedDevice* current_ = nullptr;
+    uint64_t requests_ = 0;
+    int loaderComebacks_ = 0;
+    bool unplugged_ = false;
+};
+
+// A device built from options, not yet in any tree.
+std::shared_ptr<PhysicalDevice> makeEmulatedDevice(const EmulatedDeviceOptions& options);
+// A device built from options, plugged into the host's tree in loader mode.
+LoaderModeDevice& plugInLoaderDevice(const EmulatedDeviceOptions& options = {});
+
+}  // namespace sim
