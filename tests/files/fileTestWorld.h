@@ -1,0 +1,167 @@
+// A fresh world with drive C: mapped to a temporary folder, and the kernel
+// file calls made with the structures the module builds.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cstdint>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <vector>
+
+#include "tests/support/WorldTest.h"
+
+namespace files_test {
+
+namespace fs = std::filesystem;
+namespace status = sim::kernel::fileStatus;
+
+// ZwCreateFile's arguments, as the module passes them unless a test changes one.
+struct CreateRequest {
+    std::u16string name; // the whole object name, "\??\" included
+    uint32_t desiredAccess = kFileReadAccess;
+    uint32_t shareAccess = 0;
+    uint32_t disposition = kFileOpen;
+    uint32_t options = kFileNonDirectoryFile | kFileSynchronousIoNonalert | kFileSequentialOnly;
+    uint32_t attributesLength = sizeof(OBJECT_ATTRIBUTES);
+    uint32_t attributeFlags = kObjCaseInsensitive;
+    HANDLE rootDirectory = nullptr;
+    void* eaBuffer = nullptr;
+    uint32_t eaLength = 0;
+};
+
+struct CreateResult {
+    NTSTATUS status = 0;
+    HANDLE handle = nullptr;
+    IO_STATUS_BLOCK ioStatus{};
+};
+
+struct ReadResult {
+    NTSTATUS status = 0;
+    uintptr_t information = 0;
+    std::vector<uint8_t> bytes; // the bytes the call reported as read
+};
+
+inline std::vector<uint8_t> patternBytes(size_t count, uint8_t seed = 0)
+{
+    std::vector<uint8_t> bytes(count);
+    for (size_t i = 0; i < count; ++i)
+        bytes[i] = static_cast<uint8_t>(i * 7 + seed + i / 251);
+    return bytes;
+}
+
+inline void writeFile(const fs::path& file, const std::vector<uint8_t>& bytes)
+{
+    fs::create_directories(file.parent_path());
+    std::ofstream stream(file, std::ios::binary | std::ios::trunc);
+    stream.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+}
+
+class FileWorldTest : public testing_support::WorldTest {
+  protected:
+    void SetUp() override
+    {
+        WorldTest::SetUp();
+        static int serial = 0;
+        top_ =
+            fs::path(::testing::TempDir()) / ("files-" + std::to_string(::getpid()) + "-" + std::to_string(++serial));
+        fs::remove_all(top_);
+        drive_ = top_ / "drive-c";
+        fs::create_directories(drive_);
+        sim::kernel::files().mapDrive('C', drive_);
+    }
+
+    void TearDown() override
+    {
+        WorldTest::TearDown();
+        std::error_code ignored;
+        fs::remove_all(top_, ignored);
+    }
+
+    // The folder that stands for C:, and the folder around it (outside the drive).
+    const fs::path& drive() const { return drive_; }
+    const fs::path& outside() const { return top_; }
+
+    static CreateResult create(const CreateRequest& request)
+    {
+        // A zero-filled name buffer with a counted string over it, as the module builds it.
+        std::vector<WCHAR> name(request.name.begin(), request.name.end());
+        name.resize(name.size() + 4, 0);
+        UNICODE_STRING objectName;
+        RtlInitUnicodeString(&objectName, name.data());
+        OBJECT_ATTRIBUTES attributes{
+            request.attributesLength, request.rootDirectory, &objectName, request.attributeFlags, nullptr, nullptr};
+        CreateResult result;
+        result.status = ZwCreateFile(&result.handle, request.desiredAccess, &attributes, &result.ioStatus, nullptr,
+                                     kFileAttributeNormal, request.shareAccess, request.disposition, request.options,
+                                     request.eaBuffer, request.eaLength);
+        return result;
+    }
+
+    // Opens a DOS path the way the module's image open does.
+    static CreateResult open(const std::u16string& dosPath)
+    {
+        CreateRequest request;
+        request.name = u"\\??\\" + dosPath;
+        return create(request);
+    }
+
+    // Opens a file that must open; the test fails at once otherwise.
+    static HANDLE openOrFail(const std::u16string& dosPath)
+    {
+        CreateResult result = open(dosPath);
+        EXPECT_EQ(result.status, 0);
+        return result.handle;
+    }
+
+    static ReadResult read(HANDLE file, uint32_t length, LARGE_INTEGER* byteOffset = nullptr)
+    {
+        ReadResult result;
+        std::vector<uint8_t> buffer(length + 1u, 0xEE);
+        IO_STATUS_BLOCK ioStatus{};
+        result.status =
+            ZwReadFile(file, nullptr, nullptr, nullptr, &ioStatus, buffer.data(), length, byteOffset, nullptr);
+        result.information = ioStatus.Information;
+        EXPECT_EQ(ioStatus.Status, result.status);
+        EXPECT_EQ(buffer[length], 0xEE) << "read past the buffer";
+        result.bytes.assign(buffer.begin(), buffer.begin() + std::min<uintptr_t>(ioStatus.Information, length));
+        return result;
+    }
+
+    static NTSTATUS setPosition(HANDLE file, int64_t position)
+    {
+        FILE_POSITION_INFORMATION information{};
+        information.CurrentByteOffset.QuadPart = position;
+        IO_STATUS_BLOCK ioStatus{};
+        return ZwSetInformationFile(file, &ioStatus, &information, sizeof information, kFilePositionInformation);
+    }
+
+    static int64_t position(HANDLE file)
+    {
+        FILE_POSITION_INFORMATION information{};
+        IO_STATUS_BLOCK ioStatus{};
+        EXPECT_EQ(ZwQueryInformationFile(file, &ioStatus, &information, sizeof information, kFilePositionInformation),
+                  0);
+        return information.CurrentByteOffset.QuadPart;
+    }
+
+    // Checks the misuse reports, then forgets them so the fixture's final
+    // check passes. Every handle must be closed by then.
+    static void expectMisuseReported(size_t count, const std::string& mentioning)
+    {
+        const std::vector<std::string>& reports = sim::kernel::misuseReports();
+        EXPECT_EQ(reports.size(), count);
+        for (const std::string& report : reports)
+            EXPECT_NE(report.find(mentioning), std::string::npos) << report;
+        ASSERT_EQ(sim::kernel::openHandleCount(), 0u);
+        sim::kernel::resetHandles();
+    }
+
+  private:
+    fs::path top_;
+    fs::path drive_;
+};
+
+} // namespace files_test
