@@ -72,6 +72,11 @@ const std::vector<std::string>& misuseReports()
     return table().misuse;
 }
 
+void clearMisuseReports()
+{
+    table().misuse.clear();
+}
+
 void resetHandles()
 {
     table().open.clear();

@@ -27,6 +27,8 @@ std::vector<std::string> openHandleDescriptions();
 // example) is collected here and printed to stderr at once.
 void reportMisuse(const std::string& what);
 const std::vector<std::string>& misuseReports();
+// For tests that cause misuse on purpose and have checked it.
+void clearMisuseReports();
 
 // Forgets every handle without closing it, and every report.
 void resetHandles();
