@@ -5,6 +5,7 @@
 #include "FirmwareHeader.h"
 #include "imageLocation.h"
 #include "moduleIdentity.h"
+#include "moduleMemory.h"
 #include "statusCodes.h"
 
 namespace {
@@ -22,15 +23,6 @@ void readImage(int32_t file, uint8_t* buffer, uint32_t length, tStatus& status)
     NTSTATUS result =
         ZwReadFile(imageFileHandle(file), nullptr, nullptr, nullptr, &ioStatus, buffer, length, nullptr, nullptr);
     if (result < 0 && result != kStatusEndOfFile) setFailure(status, kStatusImageReadFailed);
-}
-
-// Index of the first byte that differs, or -1.
-int32_t firstDifference(const uint8_t* expected, const uint8_t* actual, uint32_t length)
-{
-    for (uint32_t i = 0; i < length; ++i) {
-        if (expected[i] != actual[i]) return static_cast<int32_t>(i);
-    }
-    return -1;
 }
 
 void logFailure(const char* location, const char* format, uint16_t vendorId, uint16_t productId,
@@ -53,7 +45,7 @@ void programBlock(LoaderChannel& channel, uint16_t address, const uint8_t* block
     writeLoaderMemory(channel, address, block, length, status);
     readLoaderMemory(channel, address, verify, length, status);
     if (status < 0) return;
-    if (firstDifference(block, verify, length) >= 0) {
+    if (findFirstDifference(block, verify, length) >= 0) {
         logVerificationFailure(location, index);
         setFailure(status, kStatusForeignOrUnverified);
     }

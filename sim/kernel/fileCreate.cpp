@@ -89,10 +89,15 @@ bool conflictsWithOpenFiles(const FileWorld& world, const std::filesystem::path&
 
 NTSTATUS takeSnapshot(const std::filesystem::path& file, std::vector<uint8_t>& bytes)
 {
-    std::ifstream stream(file, std::ios::binary);
+    std::ifstream stream(file, std::ios::binary | std::ios::ate);
     if (!stream) return fileStatus::accessDenied;
-    bytes.assign(std::istreambuf_iterator<char>(stream), std::istreambuf_iterator<char>());
-    return stream.bad() ? fileStatus::accessDenied : kStatusSuccess;
+    // One read of the whole file: images are read at every update.
+    std::streamoff size = stream.tellg();
+    if (size < 0) return fileStatus::accessDenied;
+    bytes.resize(static_cast<size_t>(size));
+    stream.seekg(0);
+    stream.read(reinterpret_cast<char*>(bytes.data()), size);
+    return stream.gcount() == size ? kStatusSuccess : fileStatus::accessDenied;
 }
 
 NTSTATUS openResolvedFile(const std::u16string& name, uint32_t shareAccess, FileOpenRecord& record)
