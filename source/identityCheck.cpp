@@ -72,8 +72,9 @@ void readRegistryProductId(uint16_t& productId, tStatus& status)
     if (status < 0) return;
     WCHAR text[kRegistryProductIdBytes / sizeof(WCHAR) + 1];
     readStringValueAndClose(key, KTEXT("FVTPID"), kRegistryProductIdBytes, text, sizeof(text) / sizeof(WCHAR), status);
-    // A caller's positive status is success too: the value read is used.
-    if (status < 0) return;
+    // Only a clean read is converted: a status the caller brought in, even a
+    // positive one, leaves the product ID as it was.
+    if (status != 0) return;
 
     char digits[kRegistryProductIdDigits + 1];
     uint32_t count = 0;

@@ -67,7 +67,9 @@ public:
                                      device_.describe());
             refusal = kHostTransferStalled;
         }
-        setFailure(status, device_.hardware().serve(*request, refusal));
+        // Success leaves a zero or positive status as it was.
+        tStatus outcome = device_.hardware().serve(*request, refusal);
+        if (outcome < 0) setFailure(status, outcome);
     }
 
     bool open = true;
