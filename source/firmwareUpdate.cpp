@@ -15,14 +15,17 @@ constexpr char kLogTag[] = "[morvaneLoader]";
 constexpr uint16_t kMarkerOffset = 6;
 constexpr uint8_t kCompletionMarker[2] = {0xAA, 0x55};
 
-// Reads the next `length` bytes of the image. Only a failure counts; the end
-// of the file is not one.
+// Reads the next `length` bytes of the image. The size was checked before
+// anything was erased, so a read that brings fewer bytes (the end of the file
+// included) is a failure too: otherwise the rest of the block buffer, never
+// filled, would be programmed, verified against itself and marked complete.
 void readImage(int32_t file, uint8_t* buffer, uint32_t length, tStatus& status)
 {
     IO_STATUS_BLOCK ioStatus;
+    ioStatus.Information = 0;
     NTSTATUS result =
         ZwReadFile(imageFileHandle(file), nullptr, nullptr, nullptr, &ioStatus, buffer, length, nullptr, nullptr);
-    if (result < 0 && result != kStatusEndOfFile) setFailure(status, kStatusImageReadFailed);
+    if (result < 0 || ioStatus.Information != length) setFailure(status, kStatusImageReadFailed);
 }
 
 void logFailure(const char* location, const char* format, uint16_t vendorId, uint16_t productId,
