@@ -80,6 +80,7 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
     record.outcome = outcome;
     record.finishedAt = elapsed;
     RequestKind kind = record.kind;
+    if (requestObserver) requestObserver(*this, record);
     if (traceEnabled) trace.push_back(std::move(record));
 
     if (outcome >= 0 && kind == RequestKind::Restart) leaveLoaderMode();

@@ -7,6 +7,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -74,6 +75,10 @@ public:
     std::vector<RequestRecord> trace;
     std::chrono::microseconds elapsed{0};  // virtual time spent on requests
     std::vector<std::string> notes;         // what the lab may want to show; not errors
+    // Called after each request has been carried out (or refused), before it
+    // goes to the trace and before a restart re-enumerates the device; the
+    // flash already shows the request's effect. For observers such as the lab.
+    std::function<void(const PhysicalDevice&, const RequestRecord&)> requestObserver;
 
     const EmulatedDeviceOptions& options() const { return options_; }
     const LoaderFlashLayout* layout() const { return findLoaderFlashLayout(options_.loaderProductId); }

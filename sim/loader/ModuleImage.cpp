@@ -25,6 +25,8 @@ std::string ModuleImage::defaultPath()
 
 ModuleImage::ModuleImage(const std::string& path)
 {
+    // dlopen of an empty name gives the program itself, not a module.
+    if (path.empty()) throw std::runtime_error("cannot load the module: no path given");
     handle_ = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
     if (handle_ == nullptr) throw std::runtime_error(std::string("cannot load the module: ") + dlerror());
     dllInitialize = reinterpret_cast<DllInitializeFn>(resolve("DllInitialize"));
