@@ -1,19 +1,21 @@
-// Drives an emulated loader request by request, and records the arrivals and
-// removals the host delivers.
+// Drives an emulated loader request by request, and records the arrivals the
+// host delivers.
 #pragma once
 
 #include <cstring>
 #include <vector>
 
 #include "sim/device/enumeratedDevice.h"
+#include "tests/support/WorldTest.h"
 
 namespace device_tests {
 
+using DeviceTest = testing_support::WorldTest;
 constexpr uint8_t kIn = 0xC0;
 constexpr uint8_t kOut = 0x40;
 
 class RawLink {
-public:
+  public:
     explicit RawLink(sim::UsbDeviceSim& device, uint32_t bufferSize = 512) : device_(device)
     {
         nQVKORD100::tControlStreamParameterUSB parameter;
@@ -28,7 +30,6 @@ public:
     {
         tStatus status = 0;
         if (buffer != nullptr) stream->freeBuffer(buffer, status);
-        status = 0;
         if (stream != nullptr) device_.closeStream(stream, status);
         buffer = nullptr;
         stream = nullptr;
@@ -43,14 +44,13 @@ public:
         parameter.bRequest = request;
         parameter.wValue = value;
         parameter.wIndex = index;
-        tStatus status = 0;
-        stream->transfer(&parameter, status);
+        tStatus status = stream == nullptr ? sim::kHostFailure : 0;
+        if (stream != nullptr) stream->transfer(&parameter, status);
         return status;
     }
-    std::vector<uint8_t> read(uint16_t address, uint32_t length, tStatus* outcome = nullptr)
+    std::vector<uint8_t> read(uint16_t address, uint32_t length)
     {
-        tStatus status = send(kIn, 0xB0, 0, address, length, buffer);
-        if (outcome != nullptr) *outcome = status;
+        send(kIn, 0xB0, 0, address, length, buffer);
         return std::vector<uint8_t>(buffer, buffer + length);
     }
     tStatus write(uint16_t address, const std::vector<uint8_t>& bytes)
@@ -65,53 +65,31 @@ public:
     ControlStream* stream = nullptr;
     uint8_t* buffer = nullptr;
 
-private:
+  private:
     sim::UsbDeviceSim& device_;
 };
 
-// Listens on the tree for as long as it lives.
-class EventLog {
-public:
-    struct Event {
-        bool arrival;
-        sim::UsbDeviceSim* device;
-    };
-
-    explicit EventLog(sim::DeviceTreeSim& tree) : tree_(tree), query_(tree.createQuery())
+// Records the arrivals the host delivers, for as long as it lives.
+class ArrivalLog : public DeviceEventCallback {
+  public:
+    explicit ArrivalLog(sim::DeviceTreeSim& tree) : tree_(tree), query_(tree.createQuery())
     {
-        arrivals_.log = removals_.log = this;
-        arrivals_.arrival = true;
-        arrivalRecord_ = {kListenerArrival, 1, 0, query_->getId(), {}, &arrivals_};
-        removalRecord_ = {kListenerRemoval, 1, 0, query_->getId(), {}, &removals_};
         tStatus status = 0;
-        tree.addListener(&arrivalRecord_, status);
-        tree.addListener(&removalRecord_, status);
+        tree.addListener(&record_, status);
     }
-    ~EventLog()
+    ~ArrivalLog()
     {
-        tree_.removeListener(&arrivalRecord_, nullptr);
-        tree_.removeListener(&removalRecord_, nullptr);
+        tree_.removeListener(&record_, nullptr);
         tree_.releaseQuery(&query_);
     }
+    void onDeviceEvent(UsbDevice* device) override { arrivals.push_back(static_cast<sim::UsbDeviceSim*>(device)); }
 
-    std::vector<Event> events;
+    std::vector<sim::UsbDeviceSim*> arrivals;
 
-private:
-    struct Listener : DeviceEventCallback {
-        void onDeviceEvent(UsbDevice* device) override
-        {
-            log->events.push_back({arrival, static_cast<sim::UsbDeviceSim*>(device)});
-        }
-        EventLog* log = nullptr;
-        bool arrival = false;
-    };
-
+  private:
     sim::DeviceTreeSim& tree_;
     DeviceQuery* query_;
-    Listener arrivals_;
-    Listener removals_;
-    ListenerRecord arrivalRecord_;
-    ListenerRecord removalRecord_;
+    ListenerRecord record_{kListenerArrival, 1, 0, query_->getId(), {}, this};
 };
 
 }  // namespace device_tests

@@ -5,22 +5,24 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <cstdint>
 #include <filesystem>
 #include <fstream>
 #include <string>
 #include <vector>
 
+#include "sim/kernel/kernelUtf16.h"
 #include "tests/support/WorldTest.h"
 
 namespace files_test {
 
 namespace fs = std::filesystem;
 namespace status = sim::kernel::fileStatus;
+using sim::kernel::files;
 
 // ZwCreateFile's arguments, as the module passes them unless a test changes one.
 struct CreateRequest {
-    std::u16string name; // the whole object name, "\??\" included
+    std::u16string name = u"\\??\\C:\\image.bin";  // the whole object name
+    int nameBytes = -1;                            // the counted length, when not -1
     uint32_t desiredAccess = kFileReadAccess;
     uint32_t shareAccess = 0;
     uint32_t disposition = kFileOpen;
@@ -28,7 +30,6 @@ struct CreateRequest {
     uint32_t attributesLength = sizeof(OBJECT_ATTRIBUTES);
     uint32_t attributeFlags = kObjCaseInsensitive;
     HANDLE rootDirectory = nullptr;
-    void* eaBuffer = nullptr;
     uint32_t eaLength = 0;
 };
 
@@ -40,23 +41,21 @@ struct CreateResult {
 
 struct ReadResult {
     NTSTATUS status = 0;
-    uintptr_t information = 0;
-    std::vector<uint8_t> bytes; // the bytes the call reported as read
+    std::vector<uint8_t> bytes;  // as many as the call reported read
 };
 
 inline std::vector<uint8_t> patternBytes(size_t count, uint8_t seed = 0)
 {
     std::vector<uint8_t> bytes(count);
-    for (size_t i = 0; i < count; ++i)
-        bytes[i] = static_cast<uint8_t>(i * 7 + seed + i / 251);
+    for (size_t i = 0; i < count; ++i) bytes[i] = static_cast<uint8_t>(i * 7 + seed + i / 251);
     return bytes;
 }
 
 inline void writeFile(const fs::path& file, const std::vector<uint8_t>& bytes)
 {
     fs::create_directories(file.parent_path());
-    std::ofstream stream(file, std::ios::binary | std::ios::trunc);
-    stream.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+    std::ofstream(file, std::ios::binary)
+        .write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
 }
 
 class FileWorldTest : public testing_support::WorldTest {
@@ -68,11 +67,9 @@ class FileWorldTest : public testing_support::WorldTest {
         top_ =
             fs::path(::testing::TempDir()) / ("files-" + std::to_string(::getpid()) + "-" + std::to_string(++serial));
         fs::remove_all(top_);
-        drive_ = top_ / "drive-c";
-        fs::create_directories(drive_);
-        sim::kernel::files().mapDrive('C', drive_);
+        fs::create_directories(drive());
+        files().mapDrive('C', drive());
     }
-
     void TearDown() override
     {
         WorldTest::TearDown();
@@ -81,7 +78,7 @@ class FileWorldTest : public testing_support::WorldTest {
     }
 
     // The folder that stands for C:, and the folder around it (outside the drive).
-    const fs::path& drive() const { return drive_; }
+    fs::path drive() const { return top_ / "drive-c"; }
     const fs::path& outside() const { return top_; }
 
     static CreateResult create(const CreateRequest& request)
@@ -91,43 +88,40 @@ class FileWorldTest : public testing_support::WorldTest {
         name.resize(name.size() + 4, 0);
         UNICODE_STRING objectName;
         RtlInitUnicodeString(&objectName, name.data());
+        if (request.nameBytes >= 0) objectName.Length = static_cast<uint16_t>(request.nameBytes);
         OBJECT_ATTRIBUTES attributes{
             request.attributesLength, request.rootDirectory, &objectName, request.attributeFlags, nullptr, nullptr};
         CreateResult result;
         result.status = ZwCreateFile(&result.handle, request.desiredAccess, &attributes, &result.ioStatus, nullptr,
                                      kFileAttributeNormal, request.shareAccess, request.disposition, request.options,
-                                     request.eaBuffer, request.eaLength);
+                                     nullptr, request.eaLength);
         return result;
     }
 
     // Opens a DOS path the way the module's image open does.
-    static CreateResult open(const std::u16string& dosPath)
-    {
-        CreateRequest request;
-        request.name = u"\\??\\" + dosPath;
-        return create(request);
-    }
-
-    // Opens a file that must open; the test fails at once otherwise.
     static HANDLE openOrFail(const std::u16string& dosPath)
     {
-        CreateResult result = open(dosPath);
-        EXPECT_EQ(result.status, 0);
+        CreateResult result = create({u"\\??\\" + dosPath});
+        EXPECT_EQ(result.status, 0) << sim::kernel::toUtf8(dosPath);
         return result.handle;
     }
 
     static ReadResult read(HANDLE file, uint32_t length, LARGE_INTEGER* byteOffset = nullptr)
     {
-        ReadResult result;
         std::vector<uint8_t> buffer(length + 1u, 0xEE);
         IO_STATUS_BLOCK ioStatus{};
-        result.status =
+        NTSTATUS result =
             ZwReadFile(file, nullptr, nullptr, nullptr, &ioStatus, buffer.data(), length, byteOffset, nullptr);
-        result.information = ioStatus.Information;
-        EXPECT_EQ(ioStatus.Status, result.status);
+        EXPECT_EQ(ioStatus.Status, result);
         EXPECT_EQ(buffer[length], 0xEE) << "read past the buffer";
-        result.bytes.assign(buffer.begin(), buffer.begin() + std::min<uintptr_t>(ioStatus.Information, length));
-        return result;
+        EXPECT_LE(ioStatus.Information, length);
+        buffer.resize(std::min<uintptr_t>(ioStatus.Information, length));
+        return {result, buffer};
+    }
+
+    static NTSTATUS querySize(HANDLE file, FILE_STANDARD_INFORMATION& information, IO_STATUS_BLOCK& ioStatus)
+    {
+        return ZwQueryInformationFile(file, &ioStatus, &information, sizeof information, kFileStandardInformation);
     }
 
     static NTSTATUS setPosition(HANDLE file, int64_t position)
@@ -138,30 +132,17 @@ class FileWorldTest : public testing_support::WorldTest {
         return ZwSetInformationFile(file, &ioStatus, &information, sizeof information, kFilePositionInformation);
     }
 
-    static int64_t position(HANDLE file)
-    {
-        FILE_POSITION_INFORMATION information{};
-        IO_STATUS_BLOCK ioStatus{};
-        EXPECT_EQ(ZwQueryInformationFile(file, &ioStatus, &information, sizeof information, kFilePositionInformation),
-                  0);
-        return information.CurrentByteOffset.QuadPart;
-    }
-
-    // Checks the misuse reports, then forgets them so the fixture's final
-    // check passes. Every handle must be closed by then.
+    // Checks the misuse reports, then forgets them so the fixture's final check passes.
     static void expectMisuseReported(size_t count, const std::string& mentioning)
     {
-        const std::vector<std::string>& reports = sim::kernel::misuseReports();
-        EXPECT_EQ(reports.size(), count);
-        for (const std::string& report : reports)
+        EXPECT_EQ(sim::kernel::misuseReports().size(), count);
+        for (const std::string& report : sim::kernel::misuseReports())
             EXPECT_NE(report.find(mentioning), std::string::npos) << report;
-        ASSERT_EQ(sim::kernel::openHandleCount(), 0u);
-        sim::kernel::resetHandles();
+        sim::kernel::clearMisuseReports();
     }
 
   private:
     fs::path top_;
-    fs::path drive_;
 };
 
-} // namespace files_test
+}  // namespace files_test

@@ -1,5 +1,6 @@
-// Opening files by DOS name: how names map onto the drive's folder, and which
-// names are refused.
+// Opening files by DOS name: how names map onto the drive's folder, which
+// names and requests are refused and reported, and the module's opens without
+// sharing.
 #include "fileTestWorld.h"
 
 namespace files_test {
@@ -7,158 +8,141 @@ namespace {
 
 using OpenTest = FileWorldTest;
 
-TEST_F(OpenTest, OpensAnExistingFileWhateverTheCaseOfItsName)
+TEST_F(OpenTest, OpensAnExistingFileWhateverTheAsciiCaseOfItsName)
 {
     fs::path image = drive() / "Windows" / "System32" / "drivers" / "QVUSB0000.bin";
     writeFile(image, patternBytes(600));
 
-    CreateResult result = open(u"c:\\WINDOWS\\system32\\DRIVERS\\qvusb0000.BIN");
+    HANDLE file = openOrFail(u"c:\\WINDOWS\\system32\\DRIVERS\\qvusb0000.BIN");
 
-    ASSERT_EQ(result.status, 0);
-    EXPECT_EQ(result.ioStatus.Status, 0);
-    EXPECT_EQ(result.ioStatus.Information, status::fileOpened);
-    EXPECT_EQ(sim::kernel::files().openFileCount(), 1u);
-    ASSERT_EQ(sim::kernel::files().opens().size(), 1u);
-    const sim::kernel::FileOpenRecord& record = sim::kernel::files().opens()[0];
-    EXPECT_EQ(record.dosPath, "\\??\\c:\\WINDOWS\\system32\\DRIVERS\\qvusb0000.BIN");
-    EXPECT_EQ(record.hostPath, fs::canonical(image));
-    EXPECT_EQ(record.handle, result.handle);
-    EXPECT_EQ(read(result.handle, 600).bytes, patternBytes(600));
-
-    EXPECT_EQ(ZwClose(result.handle), 0);
-    EXPECT_EQ(sim::kernel::files().openFileCount(), 0u);
-    EXPECT_EQ(sim::kernel::files().filesOpened(), std::vector<fs::path>{fs::canonical(image)});
+    EXPECT_EQ(files().opens().at(0).dosPath, "\\??\\c:\\WINDOWS\\system32\\DRIVERS\\qvusb0000.BIN");
+    // Kernel handles are negative: the module narrows them to 32 bits and back.
+    intptr_t value = reinterpret_cast<intptr_t>(file);
+    EXPECT_LT(value, 0);
+    EXPECT_EQ(static_cast<intptr_t>(static_cast<int32_t>(value)), value);
+    EXPECT_EQ(read(file, 600).bytes, patternBytes(600));
+    EXPECT_EQ(ZwClose(file), 0);
+    EXPECT_EQ(files().openFileCount(), 0u);
+    EXPECT_EQ(files().filesOpened(), std::vector<fs::path>{fs::canonical(image)});
 }
 
-struct RefusedName {
-    const char16_t* dosPath;
-    NTSTATUS expected;
-    const char* why;
-};
-
-class RefusedNameTest : public FileWorldTest, public ::testing::WithParamInterface<RefusedName> {};
-
-TEST_P(RefusedNameTest, IsRefusedAndNothingIsOpened)
+TEST_F(OpenTest, AnExactMatchWinsNonAsciiMatchesAsItIsAndLinksInsideAreFollowed)
 {
-    writeFile(drive() / "drivers" / "image.bin", patternBytes(16));
-    writeFile(drive() / "drivers" / "\xC3\x84rger.bin", patternBytes(16)); // "Ärger.bin"
-    writeFile(outside() / "outside.bin", patternBytes(16));
+    for (const char* name : {"Image.bin", "image.bin", "IMAGE.bin", "drivers/\xC3\x84rger.bin"})  // "Ärger.bin"
+        writeFile(drive() / name, {});
+    fs::create_directory_symlink(drive() / "drivers", drive() / "alias");
+    fs::create_symlink(drive() / "drivers" / "\xC3\x84rger.bin", drive() / "shortcut.bin");
+
+    const std::pair<const char16_t*, fs::path> cases[] = {
+        {u"C:\\Image.bin", "Image.bin"},
+        {u"C:\\image.bin", "image.bin"},
+        {u"C:\\IMAGE.bin", "IMAGE.bin"},
+        {u"C:\\DRIVERS\\\u00C4RGER.BIN", "drivers/\xC3\x84rger.bin"},
+        {u"C:\\alias\\\u00C4rger.BIN", "drivers/\xC3\x84rger.bin"},
+        {u"C:\\Shortcut.bin", "drivers/\xC3\x84rger.bin"},
+    };
+    for (const auto& [name, file] : cases) {
+        SCOPED_TRACE(sim::kernel::toUtf8(name));
+        EXPECT_EQ(ZwClose(openOrFail(name)), 0);
+        EXPECT_EQ(files().opens().back().hostPath, fs::canonical(drive() / file));
+    }
+    // With no exact match, the choice is the same every time.
+    for (int i = 0; i < 2; ++i) EXPECT_EQ(ZwClose(openOrFail(u"C:\\image.BIN")), 0);
+    EXPECT_EQ(files().opens().back().hostPath, files().opens()[files().opens().size() - 2].hostPath);
+}
+
+TEST_F(OpenTest, RefusedNamesOpenNothing)
+{
+    writeFile(drive() / "drivers" / "image.bin", {});
+    writeFile(outside() / "outside.bin", {});
     fs::create_directory_symlink(outside(), drive() / "escape");
     fs::create_symlink(outside() / "outside.bin", drive() / "link-out.bin");
     fs::create_symlink(drive() / "gone.bin", drive() / "dangling.bin");
+    files().mapDrive('q', drive());
+    files().unmapDrive('Q');
 
-    CreateResult result = open(GetParam().dosPath);
-
-    EXPECT_EQ(result.status, GetParam().expected) << std::hex << result.status;
-    EXPECT_EQ(result.ioStatus.Status, GetParam().expected);
-    EXPECT_EQ(result.handle, nullptr);
-    EXPECT_EQ(sim::kernel::files().openFileCount(), 0u);
-    EXPECT_TRUE(sim::kernel::files().filesOpened().empty());
-    ASSERT_EQ(sim::kernel::files().opens().size(), 1u);
-    EXPECT_EQ(sim::kernel::files().opens()[0].status, GetParam().expected);
-}
-
-const RefusedName kRefusedNames[] = {
-    {u"C:\\drivers\\missing.bin", status::objectNameNotFound, "missing file"},
-    {u"C:\\nowhere\\image.bin", status::objectPathNotFound, "missing directory on the way"},
-    {u"C:\\drivers\\image.bin\\more.bin", status::objectPathNotFound, "a file used as a directory"},
-    {u"C:\\drivers", status::fileIsADirectory, "a directory"},
-    {u"C:\\", status::fileIsADirectory, "the drive's root"},
-    {u"C:\\drivers\\image.bin\\", status::objectNameInvalid, "a file named as a directory"},
-    {u"C:\\drivers\\..\\drivers\\image.bin", status::objectNameInvalid, "dot-dot, even staying inside"},
-    {u"C:\\..\\outside.bin", status::objectNameInvalid, "dot-dot leaving the drive"},
-    {u"C:\\.\\drivers\\image.bin", status::objectNameInvalid, "a dot component"},
-    {u"C:\\escape\\outside.bin", status::objectNameInvalid, "a directory link leaving the drive"},
-    {u"C:\\link-out.bin", status::objectNameInvalid, "a file link leaving the drive"},
-    {u"C:\\dangling.bin", status::objectNameNotFound, "a link to nothing"},
-    {u"C:\\drivers/image.bin", status::objectNameInvalid, "a slash is no separator"},
-    {u"C:\\drivers\\\\image.bin", status::objectNameInvalid, "an empty component"},
-    {u"C:\\drivers\\image.bin:stream", status::objectNameInvalid, "a stream name"},
-    {u"C:\\drivers\\ima\u0001e.bin", status::objectNameInvalid, "a control character"},
-    {u"C:\\drivers\\\xD800image.bin", status::objectNameInvalid, "a lone surrogate"},
-    {u"C:\\drivers\\\u00E4rger.bin", status::objectNameNotFound, "case folds for ASCII only"},
-    {u"Q:\\drivers\\image.bin", status::objectPathNotFound, "an unmapped drive"},
-    {u"C:drivers\\image.bin", status::objectPathNotFound, "no such DOS device"},
-    {u"", status::objectNameInvalid, "nothing after the prefix"},
-};
-
-INSTANTIATE_TEST_SUITE_P(Names, RefusedNameTest, ::testing::ValuesIn(kRefusedNames));
-
-TEST_F(OpenTest, NonAsciiNamesMatchExactly)
-{
-    writeFile(drive() / "drivers" / "\xC3\x84rger.bin", patternBytes(16)); // "Ärger.bin"
-
-    HANDLE file = openOrFail(u"C:\\DRIVERS\\\u00C4RGER.BIN");
-
-    EXPECT_EQ(sim::kernel::files().opens()[0].dosPath, "\\??\\C:\\DRIVERS\\\xC3\x84RGER.BIN");
-    EXPECT_EQ(ZwClose(file), 0);
-}
-
-TEST_F(OpenTest, NamesWithoutTheDosDevicesPrefixAreInvalid)
-{
-    writeFile(drive() / "image.bin", patternBytes(16));
-    for (const char16_t* name : {u"C:\\image.bin", u"\\Device\\HarddiskVolume1\\image.bin", u"\\??C:\\image.bin"}) {
-        CreateRequest request;
-        request.name = name;
-        EXPECT_EQ(create(request).status, status::objectNameInvalid);
-    }
-    EXPECT_EQ(sim::kernel::files().openFileCount(), 0u);
-}
-
-TEST_F(OpenTest, LinksThatStayInsideTheDriveAreFollowed)
-{
-    fs::path image = drive() / "drivers" / "image.bin";
-    writeFile(image, patternBytes(16));
-    fs::create_directory_symlink(drive() / "drivers", drive() / "alias");
-    fs::create_symlink(image, drive() / "shortcut.bin");
-
-    for (const char16_t* name : {u"C:\\alias\\IMAGE.bin", u"C:\\Shortcut.bin"}) {
-        HANDLE file = openOrFail(name);
-        EXPECT_EQ(sim::kernel::files().opens().back().hostPath, fs::canonical(image));
-        EXPECT_EQ(ZwClose(file), 0);
-    }
-}
-
-TEST_F(OpenTest, AnExactMatchWinsOverOtherSpellings)
-{
-    writeFile(drive() / "Image.bin", patternBytes(8, 1));
-    writeFile(drive() / "image.bin", patternBytes(8, 2));
-    writeFile(drive() / "IMAGE.bin", patternBytes(8, 3));
-
-    struct Case {
-        const char16_t* name;
-        uint8_t seed;
+    const std::tuple<const char16_t*, NTSTATUS, const char*> cases[] = {
+        {u"\\??\\C:\\drivers\\missing.bin", status::objectNameNotFound, "a missing file"},
+        {u"\\??\\C:\\nowhere\\image.bin", status::objectPathNotFound, "a missing directory on the way"},
+        {u"\\??\\C:\\drivers", status::fileIsADirectory, "a directory"},
+        {u"\\??\\C:\\drivers\\image.bin\\", status::objectNameInvalid, "a file named as a directory"},
+        {u"\\??\\C:\\..\\outside.bin", status::objectNameInvalid, "dot-dot leaving the drive"},
+        {u"\\??\\C:\\escape\\outside.bin", status::objectNameInvalid, "a directory link leaving the drive"},
+        {u"\\??\\C:\\link-out.bin", status::objectNameInvalid, "a file link leaving the drive"},
+        {u"\\??\\C:\\dangling.bin", status::objectNameNotFound, "a link to nothing"},
+        {u"\\??\\C:\\drivers/image.bin", status::objectNameInvalid, "a slash is no separator"},
+        {u"\\??\\C:\\drivers\\\xD800image.bin", status::objectNameInvalid, "a lone surrogate"},
+        {u"\\??\\Q:\\drivers\\image.bin", status::objectPathNotFound, "an unmapped drive"},
+        {u"\\??\\", status::objectNameInvalid, "nothing after the prefix"},
+        {u"C:\\drivers\\image.bin", status::objectNameInvalid, "no DOS devices prefix"},
     };
-    for (Case c : {Case{u"C:\\Image.bin", 1}, Case{u"C:\\image.bin", 2}, Case{u"C:\\IMAGE.bin", 3}}) {
-        HANDLE file = openOrFail(c.name);
-        EXPECT_EQ(read(file, 8).bytes, patternBytes(8, c.seed));
-        EXPECT_EQ(ZwClose(file), 0);
+    for (const auto& [name, expected, why] : cases) {
+        SCOPED_TRACE(why);
+        CreateResult result = create({name});
+        EXPECT_EQ(result.status, expected) << std::hex << result.status;
+        EXPECT_EQ(result.ioStatus.Status, expected);
+        EXPECT_EQ(result.handle, nullptr);
+        EXPECT_EQ(files().opens().back().status, expected);
     }
-    // With no exact match, the choice is the same every time.
-    HANDLE first = openOrFail(u"C:\\image.BIN");
-    fs::path chosen = sim::kernel::files().opens().back().hostPath;
-    EXPECT_EQ(ZwClose(first), 0);
-    HANDLE second = openOrFail(u"C:\\image.BIN");
-    EXPECT_EQ(sim::kernel::files().opens().back().hostPath, chosen);
-    EXPECT_EQ(ZwClose(second), 0);
+    EXPECT_TRUE(files().filesOpened().empty());
 }
 
-TEST_F(OpenTest, DrivesCanBeRemappedAndUnmapped)
+TEST_F(OpenTest, OpensTheModuleNeverAsksForAreRefusedAndReported)
 {
-    fs::path other = outside() / "drive-d";
-    writeFile(other / "image.bin", patternBytes(16));
+    writeFile(drive() / "image.bin", {});
+    using Change = void (*)(CreateRequest&);
+    const std::tuple<const char*, Change, NTSTATUS> cases[] = {
+        {"create a file", [](CreateRequest& r) { r.disposition = 2; }, status::invalidParameter},
+        {"write data", [](CreateRequest& r) { r.desiredAccess |= 0x2; }, status::accessDenied},
+        {"no read access", [](CreateRequest& r) { r.desiredAccess = 0x20000; }, status::accessDenied},
+        {"directories allowed", [](CreateRequest& r) { r.options &= ~kFileNonDirectoryFile; },
+         status::invalidParameter},
+        {"asynchronous", [](CreateRequest& r) { r.options &= ~kFileSynchronousIoNonalert; }, status::invalidParameter},
+        {"share nonsense", [](CreateRequest& r) { r.shareAccess = 0x10; }, status::invalidParameter},
+        {"short attributes", [](CreateRequest& r) { r.attributesLength = 40; }, status::invalidParameter},
+        {"case-sensitive", [](CreateRequest& r) { r.attributeFlags = 0; }, status::invalidParameter},
+        {"relative to a root", [](CreateRequest& r) { r.rootDirectory = reinterpret_cast<HANDLE>(-4); },
+         status::invalidParameter},
+        {"extended attributes", [](CreateRequest& r) { r.eaLength = 8; }, status::invalidParameter},
+        {"odd counted name", [](CreateRequest& r) { r.nameBytes = 3; }, status::objectNameInvalid},
+    };
+    for (const auto& [what, change, expected] : cases) {
+        SCOPED_TRACE(what);
+        CreateRequest request;
+        change(request);
+        CreateResult result = create(request);
+        EXPECT_EQ(result.status, expected);
+        EXPECT_EQ(result.handle, nullptr);
+        expectMisuseReported(1, "ZwCreateFile");
+    }
+    EXPECT_TRUE(files().filesOpened().empty());
 
-    EXPECT_EQ(open(u"D:\\image.bin").status, status::objectPathNotFound);
-    sim::kernel::files().mapDrive('d', other);
-    HANDLE file = openOrFail(u"d:\\image.bin");
-    EXPECT_EQ(ZwClose(file), 0);
-    sim::kernel::files().unmapDrive('D');
-    EXPECT_EQ(open(u"D:\\image.bin").status, status::objectPathNotFound);
-
-    // A drive whose folder is gone has no paths at all.
-    sim::kernel::files().mapDrive('E', outside() / "not-there");
-    EXPECT_EQ(open(u"E:\\image.bin").status, status::objectPathNotFound);
+    // A kernel handle may be asked for, and the name is read only as far as its counted length.
+    CreateRequest request;
+    request.attributeFlags |= 0x200;
+    request.nameBytes = static_cast<int>(request.name.size() * sizeof(WCHAR));
+    request.name += u"XYZ";
+    EXPECT_EQ(ZwClose(create(request).handle), 0);
 }
 
-} // namespace
-} // namespace files_test
+TEST_F(OpenTest, AFileHeldOpenByTheModuleOrElsewhereCannotBeOpenedUntilReleased)
+{
+    for (const char* name : {"image.bin", "other.bin", "third.bin"}) writeFile(drive() / name, {});
+    HANDLE first = openOrFail(u"C:\\image.bin");
+    sim::kernel::FileHoldToken hold = files().holdOpenElsewhere(drive() / "other.bin");
+
+    EXPECT_EQ(create({u"\\??\\C:\\IMAGE.bin"}).status, status::sharingViolation);  // another spelling, the same file
+    CreateRequest sharing;
+    sharing.shareAccess = 1;
+    EXPECT_EQ(create(sharing).status, status::sharingViolation);  // even an open that shares reading
+    EXPECT_EQ(create({u"\\??\\C:\\other.bin"}).ioStatus.Status, status::sharingViolation);
+    EXPECT_EQ(ZwClose(openOrFail(u"C:\\third.bin")), 0);
+
+    EXPECT_EQ(ZwClose(first), 0);
+    files().releaseHold(hold);
+    EXPECT_EQ(ZwClose(openOrFail(u"C:\\image.bin")), 0);
+    EXPECT_EQ(ZwClose(openOrFail(u"C:\\other.bin")), 0);
+}
+
+}  // namespace
+}  // namespace files_test

@@ -1,6 +1,5 @@
-// Reading through the file position, and the size and position queries.
-#include <cstring>
-
+// Reading through the file position, the size and position calls, and the
+// failures injected into them.
 #include "fileTestWorld.h"
 
 namespace files_test {
@@ -11,7 +10,6 @@ class ReadTest : public FileWorldTest {
     void SetUp() override
     {
         FileWorldTest::SetUp();
-        content_ = patternBytes(1000);
         writeFile(drive() / "image.bin", content_);
         file_ = openOrFail(u"C:\\image.bin");
     }
@@ -25,74 +23,27 @@ class ReadTest : public FileWorldTest {
         return std::vector<uint8_t>(content_.begin() + from, content_.begin() + from + count);
     }
 
-    std::vector<uint8_t> content_;
+    const std::vector<uint8_t> content_ = patternBytes(1000);
     HANDLE file_ = nullptr;
 };
 
-TEST_F(ReadTest, ReadsFollowOneAnotherThenStopShortThenMeetTheEnd)
+TEST_F(ReadTest, ReadsFollowThePositionStopShortAtTheEndThenMeetIt)
 {
-    ReadResult first = read(file_, 512);
-    EXPECT_EQ(first.status, 0);
-    EXPECT_EQ(first.information, 512u);
-    EXPECT_EQ(first.bytes, slice(0, 512));
+    EXPECT_EQ(read(file_, 512).bytes, slice(0, 512));
+    ReadResult shortRead = read(file_, 512);
+    EXPECT_EQ(shortRead.status, 0);
+    EXPECT_EQ(shortRead.bytes, slice(512, 488));
+    for (int i = 0; i < 2; ++i) EXPECT_EQ(read(file_, 512).status, kStatusEndOfFile);
+    EXPECT_EQ(read(file_, 0).status, 0);  // an empty read succeeds even at the end
+    EXPECT_EQ(files().reads().at(1).bytesRead, 488u);
 
-    ReadResult second = read(file_, 512);
-    EXPECT_EQ(second.status, 0);
-    EXPECT_EQ(second.information, 488u);
-    EXPECT_EQ(second.bytes, slice(512, 488));
-
-    for (int i = 0; i < 2; ++i) {
-        ReadResult end = read(file_, 512);
-        EXPECT_EQ(end.status, kStatusEndOfFile);
-        EXPECT_EQ(end.information, 0u);
-    }
-    EXPECT_EQ(position(file_), 1000);
-
-    const auto& reads = sim::kernel::files().reads();
-    ASSERT_EQ(reads.size(), 4u);
-    EXPECT_EQ(reads[1].handle, file_);
-    EXPECT_EQ(reads[1].length, 512u);
-    EXPECT_EQ(reads[1].offset, 512);
-    EXPECT_EQ(reads[1].bytesRead, 488u);
-    EXPECT_EQ(reads[3].status, kStatusEndOfFile);
-}
-
-TEST_F(ReadTest, ASetPositionMovesTheNextRead)
-{
     ASSERT_EQ(setPosition(file_, 514), 0);
     EXPECT_EQ(read(file_, 60).bytes, slice(514, 60));
-    EXPECT_EQ(position(file_), 574);
-
-    ASSERT_EQ(setPosition(file_, 0), 0);
-    EXPECT_EQ(read(file_, 4).bytes, slice(0, 4));
-
-    // Past the end is a valid position; reading there meets the end.
+    EXPECT_EQ(read(file_, 10).bytes, slice(574, 10));
+    // Past the end is a valid position, where reads meet the end; before the start is not.
     ASSERT_EQ(setPosition(file_, 5000), 0);
     EXPECT_EQ(read(file_, 4).status, kStatusEndOfFile);
     EXPECT_EQ(setPosition(file_, -1), status::invalidParameter);
-    EXPECT_EQ(position(file_), 5000);
-}
-
-TEST_F(ReadTest, AByteOffsetReadsThereAndMovesThePositionAfterIt)
-{
-    LARGE_INTEGER offset;
-    offset.QuadPart = 100;
-    EXPECT_EQ(read(file_, 10, &offset).bytes, slice(100, 10));
-    EXPECT_EQ(read(file_, 10).bytes, slice(110, 10));
-
-    // The documented "current position" offset.
-    offset.u.HighPart = -1;
-    offset.u.LowPart = 0xFFFFFFFEu;
-    EXPECT_EQ(read(file_, 10, &offset).bytes, slice(120, 10));
-    EXPECT_EQ(position(file_), 130);
-}
-
-TEST_F(ReadTest, AnEmptyReadSucceedsEvenAtTheEnd)
-{
-    ASSERT_EQ(setPosition(file_, 1000), 0);
-    ReadResult empty = read(file_, 0);
-    EXPECT_EQ(empty.status, 0);
-    EXPECT_EQ(empty.information, 0u);
 }
 
 TEST_F(ReadTest, TheFileIsReadAsItWasWhenOpened)
@@ -104,72 +55,83 @@ TEST_F(ReadTest, TheFileIsReadAsItWasWhenOpened)
     EXPECT_EQ(read(file_, 1000).bytes, content_);
 }
 
-TEST_F(ReadTest, WrongInformationClassesAndShortBuffersAreRefused)
+TEST_F(ReadTest, TheSizeIsReportedOtherInformationIsRefusedAndInjectedFailuresChangeNothing)
 {
-    struct Case {
-        bool set;
-        int informationClass;
-        uint32_t length;
-        NTSTATUS expected;
-    };
-    const Case cases[] = {
-        {false, 4, 40, status::invalidInfoClass}, // FileBasicInformation
-        {false, 9, 300, status::invalidInfoClass},
+    FILE_STANDARD_INFORMATION information{};
+    IO_STATUS_BLOCK ioStatus{};
+    ASSERT_EQ(querySize(file_, information, ioStatus), 0);
+    EXPECT_EQ(information.EndOfFile.QuadPart, 1000);
+
+    const std::tuple<bool, int, uint32_t, NTSTATUS> cases[] = {
+        {false, 4, 40, status::invalidInfoClass},  // FileBasicInformation
         {false, kFileStandardInformation, 23, status::infoLengthMismatch},
-        {false, kFilePositionInformation, 7, status::infoLengthMismatch},
-        {false, kFileStandardInformation, 32, 0}, // a longer buffer is fine
-        {true, kFileStandardInformation, 24, status::invalidInfoClass},
-        {true, 20, 8, status::invalidInfoClass}, // FileEndOfFileInformation: no writing
+        {true, 20, 8, status::invalidInfoClass},  // FileEndOfFileInformation: no writing
         {true, kFilePositionInformation, 4, status::infoLengthMismatch},
     };
-    for (const Case& c : cases) {
-        uint8_t buffer[300] = {};
-        IO_STATUS_BLOCK ioStatus{};
-        NTSTATUS result = c.set ? ZwSetInformationFile(file_, &ioStatus, buffer, c.length, c.informationClass)
-                                : ZwQueryInformationFile(file_, &ioStatus, buffer, c.length, c.informationClass);
-        EXPECT_EQ(result, c.expected) << (c.set ? "set " : "query ") << c.informationClass << " " << c.length;
-        EXPECT_EQ(ioStatus.Status, c.expected);
-        EXPECT_EQ(sim::kernel::files().informationCalls().back().status, c.expected);
+    for (const auto& [set, informationClass, length, expected] : cases) {
+        uint8_t buffer[64] = {};
+        NTSTATUS result = set ? ZwSetInformationFile(file_, &ioStatus, buffer, length, informationClass)
+                              : ZwQueryInformationFile(file_, &ioStatus, buffer, length, informationClass);
+        EXPECT_EQ(result, expected) << (set ? "set " : "query ") << informationClass << " " << length;
     }
-    EXPECT_EQ(position(file_), 0);
+
+    EXPECT_EQ(read(file_, 4).bytes, slice(0, 4));
+    files().failSizeQuery(status::deviceDataError);
+    files().failSetPosition(status::accessDenied);
+    EXPECT_EQ(querySize(file_, information, ioStatus), status::deviceDataError);
+    EXPECT_EQ(setPosition(file_, 50), status::accessDenied);
+    EXPECT_EQ(read(file_, 4).bytes, slice(4, 4));
+    files().clearFaults();
+    ASSERT_EQ(setPosition(file_, 50), 0);
+    EXPECT_EQ(read(file_, 4).bytes, slice(50, 4));
 }
 
-class SizeQueryTest : public FileWorldTest, public ::testing::WithParamInterface<size_t> {};
-
-TEST_P(SizeQueryTest, ReportsTheSizeAndWholeAllocationUnits)
+TEST_F(ReadTest, InjectedReadFailuresReadNothingAndKeepThePosition)
 {
-    size_t size = GetParam();
-    writeFile(drive() / "image.bin", patternBytes(size));
-    HANDLE file = openOrFail(u"C:\\image.bin");
+    ASSERT_EQ(read(file_, 10).status, 0);  // read numbers count from after this one
+    files().failReadNumber(2, status::deviceDataError);
+    files().failReadNumber(4, kStatusEndOfFile);
+    EXPECT_EQ(read(file_, 10).bytes, slice(10, 10));
+    EXPECT_EQ(read(file_, 10).status, status::deviceDataError);
+    EXPECT_EQ(read(file_, 10).bytes, slice(20, 10));
+    EXPECT_EQ(read(file_, 10).status, kStatusEndOfFile);
+    EXPECT_EQ(read(file_, 10).bytes, slice(30, 10));
 
-    FILE_STANDARD_INFORMATION information;
-    std::memset(&information, 0xCC, sizeof information);
+    files().failReads(status::deviceDataError);
+    for (int i = 0; i < 2; ++i) EXPECT_EQ(read(file_, 10).status, status::deviceDataError);
+    files().failReads(0);
+    EXPECT_EQ(read(file_, 10).bytes, slice(40, 10));
+}
+
+TEST_F(ReadTest, CallsOnAnythingButAnOpenFileAndAsynchronousReadsAreRefusedAndReported)
+{
+    writeFile(drive() / "other.bin", {});
+    HANDLE closed = openOrFail(u"C:\\other.bin");
+    ASSERT_EQ(ZwClose(closed), 0);
+    HANDLE key = sim::kernel::openHandle(sim::kernel::HandleKind::registryKey, nullptr, "a registry key");
+    uint8_t buffer[4];
     IO_STATUS_BLOCK ioStatus{};
-    ASSERT_EQ(ZwQueryInformationFile(file, &ioStatus, &information, sizeof information, kFileStandardInformation), 0);
+    for (HANDLE handle : {closed, key}) {
+        FILE_STANDARD_INFORMATION information{};
+        EXPECT_EQ(ZwReadFile(handle, nullptr, nullptr, nullptr, &ioStatus, buffer, 4, nullptr, nullptr),
+                  status::invalidHandle);
+        EXPECT_EQ(querySize(handle, information, ioStatus), status::invalidHandle);
+        EXPECT_EQ(setPosition(handle, 0), status::invalidHandle);
+    }
+    EXPECT_EQ(ZwClose(closed), status::invalidHandle);
+    EXPECT_EQ(ZwClose(key), 0);
+    expectMisuseReported(7, "which is not");
 
-    EXPECT_EQ(ioStatus.Information, sizeof(FILE_STANDARD_INFORMATION));
-    EXPECT_EQ(information.EndOfFile.QuadPart, static_cast<int64_t>(size));
-    EXPECT_EQ(information.AllocationSize.QuadPart, static_cast<int64_t>((size + 4095) / 4096 * 4096));
-    EXPECT_EQ(information.NumberOfLinks, 1u);
-    EXPECT_EQ(information.DeletePending, 0);
-    EXPECT_EQ(information.Directory, 0);
-    const auto& calls = sim::kernel::files().informationCalls();
-    ASSERT_EQ(calls.size(), 1u);
-    EXPECT_EQ(calls[0].handle, file);
-    EXPECT_FALSE(calls[0].set);
-    EXPECT_EQ(calls[0].informationClass, kFileStandardInformation);
-    EXPECT_EQ(ZwClose(file), 0);
+    LARGE_INTEGER before;
+    before.QuadPart = -5;
+    EXPECT_EQ(ZwReadFile(file_, reinterpret_cast<HANDLE>(-8), nullptr, nullptr, &ioStatus, buffer, 4, nullptr, nullptr),
+              status::invalidParameter);
+    EXPECT_EQ(ZwReadFile(file_, nullptr, nullptr, nullptr, &ioStatus, buffer, 4, &before, nullptr),
+              status::invalidParameter);
+    EXPECT_EQ(read(file_, 4).bytes, slice(0, 4));  // nothing was read
+    EXPECT_EQ(files().reads().size(), 1u);
+    expectMisuseReported(2, "ZwReadFile");
 }
 
-INSTANTIATE_TEST_SUITE_P(Sizes, SizeQueryTest, ::testing::Values(0, 1, 574, 4096, 4097, 70000));
-
-TEST_F(FileWorldTest, AnEmptyFileIsAtItsEndAtOnce)
-{
-    writeFile(drive() / "empty.bin", {});
-    HANDLE file = openOrFail(u"C:\\empty.bin");
-    EXPECT_EQ(read(file, 60).status, kStatusEndOfFile);
-    EXPECT_EQ(ZwClose(file), 0);
-}
-
-} // namespace
-} // namespace files_test
+}  // namespace
+}  // namespace files_test

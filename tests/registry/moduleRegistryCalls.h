@@ -11,14 +11,22 @@
 #include "kernel/ntkernel.h"
 #include "sim/kernel/kernelUtf16.h"
 #include "sim/kernel/simKernel.h"
+#include "tests/support/WorldTest.h"
 
 namespace registry_test {
 
+using namespace sim::kernel;
+using RegistryTest = testing_support::WorldTest;
+
 constexpr uint32_t kModuleRecordSize = 536;
 constexpr uint8_t kUntouched = 0xCC;
+const std::string kClassKey =
+    "\\Registry\\Machine\\System\\CurrentControlSet\\Control\\Class\\{6D2F4B10-93A7-11CF-B4E8-00C05D7A3F21}";
+const std::string kUsbKey = "\\Registry\\Machine\\System\\CurrentControlSet\\Enum\\USB\\Vid_5C1D&Pid_4B01";
+const std::string kUsbKeyOtherCase = "\\REGISTRY\\machine\\SYSTEM\\currentcontrolset\\enum\\usb\\VID_5C1D&PID_4b01";
 
 struct KeyName {
-    explicit KeyName(const std::string& path) : text(sim::kernel::toUtf16(path))
+    explicit KeyName(const std::string& path) : text(toUtf16(path))
     {
         RtlInitUnicodeString(&name, text.c_str());
         attributes.Length = sizeof(OBJECT_ATTRIBUTES);
@@ -38,35 +46,28 @@ inline NTSTATUS openKey(const std::string& path, HANDLE& handle, uint32_t* dispo
     return ZwCreateKey(&handle, kKeyRead, &key.attributes, 0, nullptr, 0, disposition);
 }
 
+// The partial-information record: title index, type and data length, then the data.
 struct QueryResult {
     NTSTATUS status = 0;
     uint32_t resultLength = 0xFFFFFFFF;
     std::vector<uint8_t> record;
 
-    uint32_t word(size_t offset) const
+    uint32_t word(size_t at) const
     {
         uint32_t value;
-        std::memcpy(&value, record.data() + offset, sizeof value);
+        std::memcpy(&value, &record[at], 4);
         return value;
     }
-    uint32_t type() const { return word(offsetof(KEY_VALUE_PARTIAL_INFORMATION, Type)); }
-    uint32_t dataLength() const { return word(offsetof(KEY_VALUE_PARTIAL_INFORMATION, DataLength)); }
-    std::vector<uint8_t> data(size_t length) const
-    {
-        auto begin = record.begin() + offsetof(KEY_VALUE_PARTIAL_INFORMATION, Data);
-        return std::vector<uint8_t>(begin, begin + static_cast<std::ptrdiff_t>(length));
-    }
+    std::vector<uint8_t> data(size_t length) const { return {record.begin() + 12, record.begin() + 12 + length}; }
 };
 
 inline QueryResult queryValue(HANDLE key, const std::string& valueName, uint32_t recordSize = kModuleRecordSize,
                               int informationClass = kKeyValuePartialInformation)
 {
-    std::u16string name16 = sim::kernel::toUtf16(valueName);
-    UNICODE_STRING name;
-    RtlInitUnicodeString(&name, name16.c_str());
+    KeyName name(valueName);  // for its counted string
     QueryResult result;
     result.record.assign(recordSize, kUntouched);
-    result.status = ZwQueryValueKey(key, &name, informationClass, recordSize ? result.record.data() : nullptr,
+    result.status = ZwQueryValueKey(key, &name.name, informationClass, recordSize ? result.record.data() : nullptr,
                                     recordSize, &result.resultLength);
     return result;
 }
@@ -75,9 +76,8 @@ inline QueryResult queryValue(HANDLE key, const std::string& valueName, uint32_t
 // final check for the unexpected ones.
 inline std::vector<std::string> takeMisuseReports()
 {
-    std::vector<std::string> reports = sim::kernel::misuseReports();
-    EXPECT_EQ(sim::kernel::openHandleCount(), 0u) << "take the reports once every handle is closed";
-    sim::kernel::resetHandles();
+    std::vector<std::string> reports = misuseReports();
+    clearMisuseReports();
     return reports;
 }
 
