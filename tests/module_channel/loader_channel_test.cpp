@@ -1,3 +1,5 @@
+// The loader channel against an emulated loader-mode device: the setup values
+// of its requests, how reads are split, and how failures end the requests.
 #include <utility>
 
 #include "sim/device/enumeratedDevice.h"
@@ -5,29 +7,19 @@
 #include "source/statusCodes.h"
 #include "tests/support/WorldTest.h"
 
-using testing_support::WorldTest;
-
 namespace {
 
 using Chunk = std::pair<uint16_t, uint32_t>;  // wIndex, length
 
-// Every byte differs from its neighbours, so a misplaced chunk shows.
-std::vector<uint8_t> patternedMemory()
-{
-    std::vector<uint8_t> bytes(0x10000);
-    for (size_t i = 0; i < bytes.size(); ++i) bytes[i] = static_cast<uint8_t>(i * 7 + (i >> 8));
-    return bytes;
-}
-
-}  // namespace
-
-class LoaderChannelTest : public WorldTest {
+class LoaderChannelTest : public testing_support::WorldTest {
 protected:
+    // A device whose every byte differs from its neighbours, so a misplaced chunk shows.
     sim::LoaderModeDevice& plugIn(uint16_t loaderProductId = 0x4A10, sim::DeviceFaults faults = {})
     {
         sim::EmulatedDeviceOptions options;
         options.loaderProductId = loaderProductId;
-        options.memory = {{0x0000, patternedMemory()}};
+        options.memory = {{0x0000, std::vector<uint8_t>(0x10000)}};
+        for (size_t i = 0; i < 0x10000; ++i) options.memory[0].bytes[i] = static_cast<uint8_t>(i * 7 + (i >> 8));
         options.faults = std::move(faults);
         return sim::plugInLoaderDevice(options);
     }
@@ -45,6 +37,8 @@ protected:
     }
 };
 
+}  // namespace
+
 TEST_F(LoaderChannelTest, ReadsGoInChunksOfAtMost64Bytes)
 {
     struct Case {
@@ -53,9 +47,6 @@ TEST_F(LoaderChannelTest, ReadsGoInChunksOfAtMost64Bytes)
         std::vector<Chunk> chunks;
     };
     const Case cases[] = {
-        {0x37F8, 1, {{0x37F8, 1}}},
-        {0x37F8, 2, {{0x37F8, 2}}},
-        {0x37F0, 16, {{0x37F0, 16}}},
         {0x0200, 64, {{0x0200, 64}}},
         {0x0200, 65, {{0x0200, 64}, {0x0240, 1}}},
         {0x0400, 100, {{0x0400, 64}, {0x0440, 36}}},
@@ -87,33 +78,8 @@ TEST_F(LoaderChannelTest, ReadsGoInChunksOfAtMost64Bytes)
     }
 }
 
-TEST_F(LoaderChannelTest, WriteEraseAndRestartSendTheLoadersSetupValues)
-{
-    sim::LoaderModeDevice& device = plugIn();
-    sim::PhysicalDevice& hardware = device.hardware();
-    tStatus status = 0;
-    LoaderChannel channel;
-    openLoaderChannel(channel, &device, 0x4A10, status);
-    std::vector<uint8_t> block(512);
-    for (size_t i = 0; i < block.size(); ++i) block[i] = static_cast<uint8_t>(0xC3 ^ i);
-
-    eraseLoaderPage(channel, 5, status);
-    writeLoaderMemory(channel, 0x0A00, block.data(), 512, status);
-    writeLoaderMemory(channel, 0x0206, "\xAA\x55", 2, status);
-    restartLoader(channel, status);
-    closeLoaderChannel(channel);
-
-    EXPECT_EQ(status, 0);
-    ASSERT_EQ(hardware.trace.size(), 4u);
-    expectSetup(hardware.trace[0], 0x40, 0xB9, 5, 0, 0);
-    expectSetup(hardware.trace[1], 0x40, 0xB0, 0, 0x0A00, 512);
-    expectSetup(hardware.trace[2], 0x40, 0xB0, 0, 0x0206, 2);
-    expectSetup(hardware.trace[3], 0x40, 0xBA, 0, 0, 0);
-    EXPECT_EQ(hardware.trace[1].data, block);
-    EXPECT_EQ(hardware.readMemory(0x0A00, 512), block);  // erased first, so it reads back whole
-}
-
-TEST_F(LoaderChannelTest, EachLoaderProductIdHasItsFlashMap)
+// Each loader product ID's flash map; the erase names the firmware's first page.
+TEST_F(LoaderChannelTest, EraseWriteAndRestartOnEachFlashMap)
 {
     struct Case {
         uint16_t loaderProductId;
@@ -121,52 +87,39 @@ TEST_F(LoaderChannelTest, EachLoaderProductIdHasItsFlashMap)
         uint16_t identityPage;
         uint16_t firstImagePage;
     };
+    std::vector<uint8_t> block(512);
+    for (size_t i = 0; i < block.size(); ++i) block[i] = static_cast<uint8_t>(0xC3 ^ i);
     for (const Case& c : {Case{0x4A10, 0x0200, 0x3600, 1}, Case{0x4A20, 0x0600, 0x7C00, 3}}) {
         SCOPED_TRACE(c.loaderProductId);
         sim::LoaderModeDevice& device = plugIn(c.loaderProductId);
+        sim::PhysicalDevice& hardware = device.hardware();
         tStatus status = 0;
         LoaderChannel channel;
         openLoaderChannel(channel, &device, c.loaderProductId, status);
         EXPECT_EQ(channel.firmwareBase, c.firmwareBase);
         EXPECT_EQ(channel.identityPage, c.identityPage);
         eraseLoaderPage(channel, static_cast<uint16_t>(channel.firmwareBase >> 9), status);
+        writeLoaderMemory(channel, c.firmwareBase, block.data(), 512, status);
+        restartLoader(channel, status);
         closeLoaderChannel(channel);
 
         EXPECT_EQ(status, 0);
-        expectSetup(device.hardware().trace.at(0), 0x40, 0xB9, c.firstImagePage, 0, 0);
-        EXPECT_EQ(device.hardware().readMemory(c.firmwareBase, 512), std::vector<uint8_t>(512, 0xFF));
+        ASSERT_EQ(hardware.trace.size(), 3u);
+        expectSetup(hardware.trace[0], 0x40, 0xB9, c.firstImagePage, 0, 0);
+        expectSetup(hardware.trace[1], 0x40, 0xB0, 0, c.firmwareBase, 512);
+        expectSetup(hardware.trace[2], 0x40, 0xBA, 0, 0, 0);
+        EXPECT_EQ(hardware.trace[1].data, block);
+        EXPECT_EQ(hardware.readMemory(c.firmwareBase, 512), block);  // erased first, so it reads back whole
     }
-}
-
-TEST_F(LoaderChannelTest, ProductIdWithoutAFlashMapOpensNothing)
-{
-    sim::LoaderModeDevice& device = plugIn();
-    for (uint16_t productId : {0x0000, 0x4A11, 0x4A30, 0x4B01, 0xFFFF}) {
-        SCOPED_TRACE(productId);
-        tStatus status = 0;
-        LoaderChannel channel;
-        openLoaderChannel(channel, &device, productId, status);
-        EXPECT_EQ(status, kStatusMissingOrMalformed);
-        EXPECT_EQ(channel.stream, nullptr);
-        EXPECT_EQ(channel.transferBuffer, nullptr);
-        closeLoaderChannel(channel);
-    }
-    EXPECT_EQ(device.openStreamCalls, 0);
-    EXPECT_EQ(device.closeStreamCalls, 0);
-    EXPECT_EQ(host().allocator.totalAllocations(), 0u);
 }
 
 TEST_F(LoaderChannelTest, NegativeStatusOnEntryDoesNothing)
 {
     sim::LoaderModeDevice& device = plugIn();
-    tStatus status = -7;
-    LoaderChannel refused;
+    tStatus status = -7, good = 0;
+    LoaderChannel refused, channel;
     openLoaderChannel(refused, &device, 0x4A10, status);
     EXPECT_EQ(refused.stream, nullptr);
-    closeLoaderChannel(refused);
-
-    tStatus good = 0;
-    LoaderChannel channel;
     openLoaderChannel(channel, &device, 0x4A10, good);
     uint8_t bytes[4] = {};
     readLoaderMemory(channel, 0x0200, bytes, 4, status);
@@ -174,77 +127,59 @@ TEST_F(LoaderChannelTest, NegativeStatusOnEntryDoesNothing)
     eraseLoaderPage(channel, 1, status);
     restartLoader(channel, status);
     closeLoaderChannel(channel);
+    closeLoaderChannel(refused);
 
     EXPECT_EQ(status, -7);
     EXPECT_EQ(device.openStreamCalls, 1);
     EXPECT_EQ(device.hardware().requestCount(), 0u);
 }
 
-TEST_F(LoaderChannelTest, FailedOpenMakesNoRequestAndCloseCleansUp)
+// A failed open (a product ID without a flash map, the stream, its buffer, or the
+// allocator), or any failed request of an update's worth (erase, a 512-byte write,
+// its eight reads back, the restart): nothing is sent after it, the first failure
+// stands, and close leaves nothing behind.
+TEST_F(LoaderChannelTest, FailuresEndTheRequestsAndCloseCleansUp)
 {
     struct Case {
         const char* what;
-        bool refuseStream;
-        bool refuseBuffer;
-        bool failAllocation;
-        tStatus expected;
-    };
-    const Case cases[] = {
-        {"stream refused", true, false, false, sim::kHostFailure},
-        {"buffer refused", false, true, false, sim::kHostAllocationFailed},
-        {"allocator out of memory", false, false, true, sim::kHostAllocationFailed},
-    };
-    for (const Case& c : cases) {
-        SCOPED_TRACE(c.what);
         sim::DeviceFaults faults;
-        faults.refuseOpenStream = c.refuseStream;
-        faults.refuseAllocateBuffer = c.refuseBuffer;
-        sim::LoaderModeDevice& device = plugIn(0x4A10, faults);
+        bool failAllocation;
+        uint16_t loaderProductId;
+        tStatus status;
+        uint64_t requests;
+    };
+    std::vector<Case> cases = {{"no failure", {}, false, 0x4A10, 0, 11},
+                               {"stream refused", {}, false, 0x4A10, sim::kHostFailure, 0},
+                               {"buffer refused", {}, false, 0x4A10, sim::kHostAllocationFailed, 0},
+                               {"allocator out of memory", {}, true, 0x4A10, sim::kHostAllocationFailed, 0},
+                               {"product 0x4A11 unmapped", {}, false, 0x4A11, kStatusMissingOrMalformed, 0}};
+    cases[1].faults.refuseOpenStream = true;
+    cases[2].faults.refuseAllocateBuffer = true;
+    for (uint64_t failing = 1; failing <= 11; ++failing) {
+        cases.push_back({"stalled", {}, false, 0x4A10, sim::kHostTransferStalled, failing});
+        cases.back().faults.stallRequests = {failing};
+        cases.push_back({"unplugged", {}, false, 0x4A10, sim::kHostDeviceGone, failing});
+        cases.back().faults.unplugAtRequest = failing;
+    }
+    for (const Case& c : cases) {
+        SCOPED_TRACE(testing::Message() << c.what << " " << c.requests);
+        sim::LoaderModeDevice& device = plugIn(0x4A10, c.faults);
         if (c.failAllocation) host().allocator.failNth(1);
         tStatus status = 0;
         LoaderChannel channel;
-        openLoaderChannel(channel, &device, 0x4A10, status);
-        EXPECT_EQ(status, c.expected);
-        EXPECT_EQ(channel.transferBuffer, nullptr);
-        readLoaderMemory(channel, 0x0200, nullptr, 4, status);
+        openLoaderChannel(channel, &device, c.loaderProductId, status);
+        std::vector<uint8_t> block(512, 0x5A), back(512);
         eraseLoaderPage(channel, 1, status);
+        writeLoaderMemory(channel, 0x0200, block.data(), 512, status);
+        readLoaderMemory(channel, 0x0200, back.data(), 512, status);
+        restartLoader(channel, status);
+        tStatus afterRequests = status;
         closeLoaderChannel(channel);
 
-        EXPECT_EQ(status, c.expected);
-        EXPECT_EQ(device.hardware().requestCount(), 0u);
+        EXPECT_EQ(status, c.status);
+        EXPECT_EQ(status, afterRequests);
+        EXPECT_EQ(device.hardware().requestCount(), c.requests);
         EXPECT_EQ(leftovers(), std::vector<std::string>{});
         host().allocator.clearFaults();
-    }
-}
-
-// An update's worth of requests: erase, a 512-byte write, its eight reads back, the restart.
-TEST_F(LoaderChannelTest, AnyFailedRequestEndsTheRequestsAndCloseStillCleansUp)
-{
-    constexpr uint64_t kRequests = 11;
-    for (bool unplug : {false, true}) {
-        for (uint64_t failing = 0; failing <= kRequests; ++failing) {
-            SCOPED_TRACE(testing::Message() << (unplug ? "unplugged at " : "stall at ") << failing);
-            sim::DeviceFaults faults;
-            if (failing != 0 && unplug) faults.unplugAtRequest = failing;
-            if (failing != 0 && !unplug) faults.stallRequests = {failing};
-            sim::LoaderModeDevice& device = plugIn(0x4A10, faults);
-            tStatus status = 0;
-            LoaderChannel channel;
-            openLoaderChannel(channel, &device, 0x4A10, status);
-            std::vector<uint8_t> block(512, 0x5A), back(512);
-            eraseLoaderPage(channel, 1, status);
-            writeLoaderMemory(channel, 0x0200, block.data(), 512, status);
-            readLoaderMemory(channel, 0x0200, back.data(), 512, status);
-            restartLoader(channel, status);
-            tStatus afterRequests = status;
-            closeLoaderChannel(channel);
-
-            tStatus expected = failing == 0 ? 0 : unplug ? sim::kHostDeviceGone : sim::kHostTransferStalled;
-            EXPECT_EQ(status, expected);
-            EXPECT_EQ(status, afterRequests);
-            EXPECT_EQ(device.hardware().requestCount(), failing == 0 ? kRequests : failing);
-            EXPECT_EQ(device.gone(), failing == 0 || unplug);  // a restart that went through, or pulled out
-            EXPECT_EQ(leftovers(), std::vector<std::string>{});
-        }
     }
 }
