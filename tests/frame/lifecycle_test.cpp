@@ -70,39 +70,43 @@ TEST_F(Lifecycle, CutsALongRegistryPathTo520Bytes)
     EXPECT_EQ(module->dllUnload(), 0);
 }
 
-TEST_F(Lifecycle, StartsAndStopsThroughTheRecordAndUnloads)
+// Reasons in turn, through the host's wrapper export and then through the
+// registered record: 0 starts (a second start keeps the running table, an empty
+// tree still gets both listeners), 1 stops (without a table, only the statics),
+// any other reason does nothing.
+TEST_F(Lifecycle, StartsStopsAndIgnoresOtherReasonsThenUnloads)
 {
+    struct Step {
+        uint32_t reason;
+        bool table;  // running afterwards
+        int removedListeners;
+    };
+    const Step steps[] = {
+        {1, false, 0},  {0, true, 0},          {0, true, 0},  {2, true, 0}, {3, true, 0},
+        {255, true, 0}, {0xFFFFFFFF, true, 0}, {1, false, 2}, {0, true, 0}, {1, false, 2},
+    };
     load();
-    EXPECT_EQ(host().callModuleMain(0), 0);
-    EXPECT_EQ(tree().liveListeners(), 2u);
-    EXPECT_EQ(tree().liveQueries(), 1u);
-    EXPECT_EQ(host().callModuleMain(1), 0);
-    EXPECT_EQ(tree().liveListeners(), 0u);
-    EXPECT_EQ(tree().liveQueries(), 0u);
-    // A second start after a stop builds a new table.
-    EXPECT_EQ(host().callModuleMain(0), 0);
-    EXPECT_EQ(tree().liveListeners(), 2u);
-    EXPECT_EQ(host().callModuleMain(1), 0);
+    for (bool throughTheRecord : {false, true}) {
+        for (const Step& step : steps) {
+            SCOPED_TRACE(std::string(throughTheRecord ? "record, " : "wrapper, ") + std::to_string(step.reason));
+            const int removalsBefore = tree().removeListenerCalls();
+            EXPECT_EQ(throughTheRecord ? host().callModuleMain(step.reason) : callSsMain(step.reason), 0);
+            EXPECT_EQ(tree().liveListeners(), step.table ? 2u : 0u);
+            EXPECT_EQ(tree().liveQueries(), step.table ? 1u : 0u);
+            EXPECT_EQ(host().allocator.liveBlocks(), step.table ? 4u : 0u) << "the table, its records, a stop node";
+            EXPECT_EQ(tree().removeListenerCalls() - removalsBefore, step.removedListeners);
+        }
+    }
+    // The wrapper passes each reason on to the host's package events; the record does not.
+    std::vector<uint32_t> events;
+    for (const sim::PackageEvent& event : host().packageEvents) events.push_back(event.event);
+    EXPECT_EQ(events, (std::vector<uint32_t>{0, 1, 0, 0, 2, 3, 255, 0xFFFFFFFF, 1, 0, 1}));
 
     EXPECT_EQ(module->dllUnload(), 0);
     EXPECT_EQ(host().unregistrations, 1);
     EXPECT_EQ(host().registeredModule, nullptr);
-    ASSERT_FALSE(host().packageEvents.empty());
     EXPECT_EQ(host().packageEvents.back().event, 1u);
     EXPECT_TRUE(host().eventLog.empty());
-}
-
-TEST_F(Lifecycle, TheWrapperExportLogsEachReasonAndReturnsTheResult)
-{
-    load();
-    EXPECT_EQ(callSsMain(0), 0);
-    EXPECT_EQ(callSsMain(1), 0);
-    EXPECT_EQ(callSsMain(7), 0);
-    std::vector<uint32_t> events;
-    for (const sim::PackageEvent& event : host().packageEvents) events.push_back(event.event);
-    EXPECT_EQ(events, (std::vector<uint32_t>{0, 0, 1, 7}));
-    EXPECT_TRUE(host().eventLog.empty());
-    EXPECT_EQ(module->dllUnload(), 0);
 }
 
 TEST_F(Lifecycle, AFailedStartThroughTheWrapperIsLoggedAndReturned)
@@ -122,51 +126,6 @@ TEST_F(Lifecycle, AFailedStartThroughTheWrapperIsLoggedAndReturned)
     EXPECT_EQ(host().callModuleMain(0), -50150);
     EXPECT_EQ(host().eventLog.size(), 1u);
     EXPECT_EQ(host().callModuleMain(1), 0);
-    EXPECT_EQ(module->dllUnload(), 0);
-}
-
-TEST_F(Lifecycle, OtherReasonsDoNothing)
-{
-    load();
-    EXPECT_EQ(callSsMain(0), 0);
-    size_t blocks = host().allocator.liveBlocks();
-    for (uint32_t reason : {2u, 3u, 255u, 0xFFFFFFFFu}) {
-        EXPECT_EQ(callSsMain(reason), 0) << reason;
-        EXPECT_EQ(host().allocator.liveBlocks(), blocks);
-        EXPECT_EQ(tree().liveListeners(), 2u);
-    }
-    EXPECT_EQ(callSsMain(1), 0);
-    EXPECT_EQ(module->dllUnload(), 0);
-}
-
-TEST_F(Lifecycle, StopWithoutATableOnlyStopsStatics)
-{
-    load();
-    EXPECT_EQ(callSsMain(1), 0);
-    EXPECT_EQ(callSsMain(1), 0);
-    EXPECT_EQ(tree().removeListenerCalls(), 0);
-    EXPECT_EQ(module->dllUnload(), 0);
-}
-
-TEST_F(Lifecycle, ASecondStartKeepsTheRunningTable)
-{
-    load();
-    EXPECT_EQ(callSsMain(0), 0);
-    EXPECT_EQ(callSsMain(0), 0);
-    EXPECT_EQ(tree().liveListeners(), 2u);
-    EXPECT_EQ(tree().liveQueries(), 1u);
-    EXPECT_EQ(callSsMain(1), 0);
-    EXPECT_EQ(tree().liveListeners(), 0u);
-    EXPECT_EQ(module->dllUnload(), 0);
-}
-
-TEST_F(Lifecycle, NoMemoryForTheTable)
-{
-    load();
-    host().allocator.failNth(1);
-    EXPECT_EQ(callSsMain(0), -50352);
-    EXPECT_EQ(tree().liveQueries(), 0u);
-    EXPECT_EQ(callSsMain(1), 0);
     EXPECT_EQ(module->dllUnload(), 0);
 }
 

@@ -10,38 +10,32 @@ namespace update_tests {
 namespace {
 
 using testing_support::kSystemVersionKey;
-using testing_support::makeImage;
 namespace fileStatus = sim::kernel::fileStatus;
+using DeviceFault = std::function<void(sim::EmulatedDeviceOptions&)>;
+using WorldFault = std::function<void(const std::filesystem::path& image)>;
 
 struct FailureCase {
     const char* name;
-    std::function<void(sim::EmulatedDeviceOptions&)> device;
-    std::function<void(const std::filesystem::path& image)> world;
+    DeviceFault device;
+    WorldFault world;
     std::vector<std::string> requests;
-    std::vector<LogLine> log;
-    uint16_t loaderProductId = 0x4A10;
+    std::vector<std::string> log;
     uint32_t imageSize = 1000;
-    bool descriptorFails = false;
-    bool streamOpened = true;
+    uint16_t loaderProductId = 0x4A10;
     bool imageLookedUp = true;
+    bool descriptorFails = false;  // then no stream is opened either
 };
 
-void PrintTo(const FailureCase& c, std::ostream* out)
-{
-    *out << c.name;
-}
-
-class Failures : public UpdateWorld, public ::testing::WithParamInterface<std::tuple<FailureCase, Arrival>> {};
+class Failures : public WithArrival<FailureCase> {};
 
 TEST_P(Failures, LeaveTheDeviceInLoaderModeAndReportOnlyTheirOwnMessages)
 {
     const auto& [c, arrival] = GetParam();
-    std::filesystem::path image = writeDefaultImage(kProductId, makeImage(c.imageSize));
+    std::filesystem::path image = writeDefaultImage(kProductId, testing_support::makeImage(c.imageSize));
     sim::EmulatedDeviceOptions options = deviceWithIdentity(c.loaderProductId, kProductId);
     if (c.device) c.device(options);
     auto hardware = sim::makeEmulatedDevice(options);
-    const uint16_t identityPage = c.loaderProductId == 0x4A10 ? 0x3600 : 0x7C00;
-    const std::vector<uint8_t> identityBefore = hardware->readMemory(identityPage, 512);
+    const std::vector<uint8_t> identityBefore = hardware->readMemory(identityPage(c.loaderProductId), 512);
     if (c.world) c.world(image);
 
     sim::LoaderModeDevice& loader =
@@ -49,9 +43,9 @@ TEST_P(Failures, LeaveTheDeviceInLoaderModeAndReportOnlyTheirOwnMessages)
 
     EXPECT_EQ(requestLines(*hardware), c.requests);
     EXPECT_EQ(logLines(), c.log);
-    EXPECT_EQ(loader.openStreamCalls, c.streamOpened ? 1 : 0);
+    EXPECT_EQ(loader.openStreamCalls, c.descriptorFails ? 0 : 1);
     EXPECT_EQ(dynamic_cast<sim::ProductDevice*>(hardware->current()), nullptr) << "the device left loader mode";
-    EXPECT_EQ(hardware->readMemory(identityPage, 512), identityBefore);
+    EXPECT_EQ(hardware->readMemory(identityPage(c.loaderProductId), 512), identityBefore);
     if (!c.imageLookedUp) {
         EXPECT_TRUE(sim::kernel::files().opens().empty());
         for (const auto& call : sim::kernel::registry().calls()) EXPECT_NE(call.valueName, "Driver");
@@ -66,71 +60,38 @@ const std::vector<std::string> kIdentity = identityReads(0x4A10);
 const std::vector<std::string> kErase = {"erase 1", "erase 2"};
 const std::vector<std::string> kBlock0 = blockRequests(0x0200, 512);
 const std::vector<std::string> kPartial = blockRequests(0x0400, 488);
+const std::vector<std::string> kProgrammed = joined({kIdentity, kErase, kBlock0, kPartial});
 
-std::function<void(sim::EmulatedDeviceOptions&)> stallRequest(uint64_t number)
+DeviceFault stallRequest(uint64_t number)
 {
     return [number](sim::EmulatedDeviceOptions& options) { options.faults.stallRequests.insert(number); };
 }
 
-std::function<void(sim::EmulatedDeviceOptions&)> stallKind(sim::RequestKind kind)
+DeviceFault stallKind(sim::RequestKind kind)
 {
     return [kind](sim::EmulatedDeviceOptions& options) { options.faults.stallKinds.insert(kind); };
 }
 
-std::function<void(sim::EmulatedDeviceOptions&)> corruptRead(uint16_t address)
+DeviceFault corruptRead(uint16_t address)
 {
     return [address](sim::EmulatedDeviceOptions& options) {
-        sim::ReadCorruption corruption;
-        corruption.address = address;
-        corruption.xorMask = 0x10;
-        options.faults.readCorruptions.push_back(corruption);
+        options.faults.readCorruptions.push_back(sim::ReadCorruption{});
+        options.faults.readCorruptions.back().address = address;
+        options.faults.readCorruptions.back().xorMask = 0x10;
     };
 }
 
-std::function<void(const std::filesystem::path&)> failImageRead(unsigned number)
+// Read 1 is the header's; the blocks follow from read 2.
+WorldFault failImageRead(unsigned number, NTSTATUS status)
 {
-    // Read 1 is the header's; the blocks follow from read 2.
-    return [number](const std::filesystem::path&) {
-        sim::kernel::files().failReadNumber(number, fileStatus::deviceDataError);
-    };
-}
-
-FailureCase withLoader(FailureCase c, uint16_t loaderProductId, uint32_t imageSize)
-{
-    c.loaderProductId = loaderProductId;
-    c.imageSize = imageSize;
-    return c;
-}
-
-FailureCase withImageSize(FailureCase c, uint32_t imageSize)
-{
-    c.imageSize = imageSize;
-    return c;
+    return [number, status](const auto&) { sim::kernel::files().failReadNumber(number, status); };
 }
 
 const FailureCase kFailureCases[] = {
-    [] {
-        FailureCase c{"DescriptorNotRead", {}, {}, {}, {}};
-        c.descriptorFails = true;
-        c.streamOpened = false;
-        c.imageLookedUp = false;
-        return c;
-    }(),
-    [] {
-        FailureCase c{"StreamNotOpened", [](auto& o) { o.faults.refuseOpenStream = true; }, {}, {}, {}};
-        c.imageLookedUp = false;
-        return c;
-    }(),
-    [] {
-        FailureCase c{"BufferNotObtained", [](auto& o) { o.faults.refuseAllocateBuffer = true; }, {}, {}, {}};
-        c.imageLookedUp = false;
-        return c;
-    }(),
-    [] {
-        FailureCase c{"ForeignIdentity", [](auto& o) { o.identity->vendorId = 0x1234; }, {}, kIdentity, {}};
-        c.imageLookedUp = false;
-        return c;
-    }(),
+    {"DescriptorNotRead", {}, {}, {}, {}, 1000, 0x4A10, false, true},
+    {"StreamNotOpened", [](auto& o) { o.faults.refuseOpenStream = true; }, {}, {}, {}, 1000, 0x4A10, false},
+    {"BufferNotObtained", [](auto& o) { o.faults.refuseAllocateBuffer = true; }, {}, {}, {}, 1000, 0x4A10, false},
+    {"ForeignIdentity", [](auto& o) { o.identity->vendorId = 0x1234; }, {}, kIdentity, {}, 1000, 0x4A10, false},
     {"NoSystemRootKey", {},
      [](const auto&) { sim::kernel::registry().deleteKey("\\Registry\\Machine\\Software\\Microsoft\\Windows NT"); },
      kIdentity, {pathNotFound(-100000)}},
@@ -140,13 +101,11 @@ const FailureCase kFailureCases[] = {
     {"ImageMissing", {}, [](const auto& image) { std::filesystem::remove(image); }, kIdentity, {}},
     {"ImageHeldOpenElsewhere", {}, [](const auto& image) { sim::kernel::files().holdOpenElsewhere(image); },
      kIdentity, {}},
-    withImageSize({"EmptyImage", {}, {}, kIdentity, {updateFailed(-50150)}}, 0),
-    withLoader({"OneByteTooLongForTheSmallLoader", {}, {}, kIdentity, {updateFailed(-50150)}}, 0x4A10, 0x3401),
-    withLoader({"OneByteTooLongForTheLargeLoader", {}, {}, identityReads(0x4A20), {updateFailed(-50150)}}, 0x4A20,
-               0x7601),
-    {"SizeQueryFails", {},
-     [](const auto&) { sim::kernel::files().failSizeQuery(fileStatus::deviceDataError); }, kIdentity,
-     {updateFailed(-50207)}},
+    {"EmptyImage", {}, {}, kIdentity, {updateFailed(-50150)}, 0},
+    {"OneByteTooLongForTheSmallLoader", {}, {}, kIdentity, {updateFailed(-50150)}, 0x3401},
+    {"OneByteTooLongForTheLargeLoader", {}, {}, identityReads(0x4A20), {updateFailed(-50150)}, 0x7601, 0x4A20},
+    {"SizeQueryFails", {}, [](const auto&) { sim::kernel::files().failSizeQuery(fileStatus::deviceDataError); },
+     kIdentity, {updateFailed(-50207)}},
     {"FirstEraseRefused", stallKind(sim::RequestKind::Erase), {}, joined({kIdentity, {"erase 1 failed"}}),
      {updateFailed(sim::kHostTransferStalled)}},
     {"SecondEraseRefused", stallRequest(5), {}, joined({kIdentity, {"erase 1", "erase 2 failed"}}),
@@ -162,35 +121,32 @@ const FailureCase kFailureCases[] = {
      joined({kIdentity, kErase, kBlock0, std::vector<std::string>(kPartial.begin(), kPartial.end() - 1),
              {"read 0x05C0 40 failed"}}),
      {updateFailed(sim::kHostTransferStalled)}},
-    {"BlockImageReadFails", {}, failImageRead(2), joined({kIdentity, kErase}), {updateFailed(-50207)}},
-    {"PartialBlockImageReadFails", {}, failImageRead(3), joined({kIdentity, kErase, kBlock0}),
+    {"BlockImageReadFails", {}, failImageRead(2, fileStatus::deviceDataError), joined({kIdentity, kErase}),
      {updateFailed(-50207)}},
-    withImageSize({"ThirdBlockDiffers", corruptRead(0x0200 + 2 * 512 + 17), {},
-                   joined({kIdentity, {"erase 1", "erase 2", "erase 3", "erase 4"}, kBlock0,
-                           blockRequests(0x0400, 512), blockRequests(0x0600, 512)}),
-                   {blockDiffers(2), updateFailed(-50152)}},
-                  2048),
-    {"PartialBlockDiffers", corruptRead(0x0400 + 487), {}, joined({kIdentity, kErase, kBlock0, kPartial}),
-     {partialBlockDiffers(1), updateFailed(-50152)}},
-    {"MarkerWriteRefused", stallRequest(24), {},
-     joined({kIdentity, kErase, kBlock0, kPartial, {"write 0x0206 2 failed"}}),
+    {"PartialBlockImageReadFails", {}, failImageRead(3, fileStatus::deviceDataError),
+     joined({kIdentity, kErase, kBlock0}), {updateFailed(-50207)}},
+    // The size was checked before the erase: a read that meets the end of the
+    // file early must not program what the block buffer happened to hold.
+    {"PartialBlockReadMeetsTheEndOfTheFile", {}, failImageRead(3, fileStatus::endOfFile),
+     joined({kIdentity, kErase, kBlock0}), {updateFailed(-50207)}},
+    {"ThirdBlockDiffers", corruptRead(0x0200 + 2 * 512 + 17), {},
+     joined({kIdentity, {"erase 1", "erase 2", "erase 3", "erase 4"}, kBlock0, blockRequests(0x0400, 512),
+             blockRequests(0x0600, 512)}),
+     {verificationFailed(421, 2), updateFailed(-50152)}, 2048},
+    {"PartialBlockDiffers", corruptRead(0x0400 + 487), {}, kProgrammed,
+     {verificationFailed(436, 1), updateFailed(-50152)}},
+    {"MarkerWriteRefused", stallRequest(24), {}, joined({kProgrammed, {"write 0x0206 2 failed"}}),
      {updateFailed(sim::kHostTransferStalled)}},
     {"RestartRefused", stallKind(sim::RequestKind::Restart), {},
-     joined({kIdentity, kErase, kBlock0, kPartial, {"write 0x0206 2", "restart failed"}}),
-     {updateFailed(sim::kHostTransferStalled)}},
+     joined({kProgrammed, {"write 0x0206 2", "restart failed"}}), {updateFailed(sim::kHostTransferStalled)}},
     {"UnpluggedWhileReadingBack", [](auto& o) { o.faults.unplugAtRequest = 10; }, {},
      joined({kIdentity, kErase, {"write 0x0200 512", "read 0x0200 64", "read 0x0240 64", "read 0x0280 64",
                                  "read 0x02C0 64 failed"}}),
      {updateFailed(sim::kHostDeviceGone)}},
 };
 
-INSTANTIATE_TEST_SUITE_P(Rows, Failures,
-                         ::testing::Combine(::testing::ValuesIn(kFailureCases),
-                                            ::testing::Values(Arrival::PresentAtStart, Arrival::PluggedInLater)),
-                         [](const auto& info) {
-                             return std::string(std::get<0>(info.param).name) + "_" +
-                                    arrivalName(std::get<1>(info.param));
-                         });
+INSTANTIATE_TEST_SUITE_P(Rows, Failures, ::testing::Combine(::testing::ValuesIn(kFailureCases), kArrivals),
+                         CaseAndArrival());
 
 }  // namespace
 }  // namespace update_tests
