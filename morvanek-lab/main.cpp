@@ -8,7 +8,7 @@
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
-#include "lib/Inspect.h"
+#include "lib/Examine.h"
 #include "lib/JsonNode.h"
 #include "lib/Lab.h"
 #include "lib/Reports.h"

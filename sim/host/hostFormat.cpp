@@ -93,16 +93,16 @@ std::string formatHostMessage(const char* format, va_list arguments)
         char conversion = *p;
         if (conversion == 0) break;
         ++p;
-        std::string spec(start, p);
+        std::string directive(start, p);
         switch (conversion) {
         case 'd':
         case 'i':
             if (longs >= 2 || size) {
-                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, long long));
+                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, long long));
             } else if (longs == 1) {
-                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, long));
+                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, long));
             } else {
-                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, int));
+                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, int));
             }
             out += piece;
             break;
@@ -111,20 +111,20 @@ std::string formatHostMessage(const char* format, va_list arguments)
         case 'X':
         case 'o':
             if (longs >= 2 || size) {
-                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, unsigned long long));
+                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, unsigned long long));
             } else if (longs == 1) {
-                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, unsigned long));
+                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, unsigned long));
             } else {
-                std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, unsigned));
+                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, unsigned));
             }
             out += piece;
             break;
         case 'c':
-            std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, int));
+            std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, int));
             out += piece;
             break;
         case 'p':
-            std::snprintf(piece, sizeof piece, spec.c_str(), va_arg(arguments, void*));
+            std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, void*));
             out += piece;
             break;
         case 's': {
@@ -140,7 +140,7 @@ std::string formatHostMessage(const char* format, va_list arguments)
             out += utf16ToUtf8(va_arg(arguments, const char16_t*));
             break;
         default:
-            out += spec;  // unknown conversion: shown as written
+            out += directive;  // unknown conversion: shown as written
             (void)half;
         }
     }

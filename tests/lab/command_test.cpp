@@ -71,7 +71,7 @@ TEST(LabCommand, ExitCodesTellInvalidAndLabErrorAndTheWorstWinsInTextAndJson)
 
 TEST(LabCommand, InspectImageSaysWhatTheModuleConcludes)
 {
-    Outcome inspect = runLab("inspect image " + kScenarios + "/images/special-4B01.bin --expect 0x0143C001 --json");
+    Outcome inspect = runLab("inspect image " + kScenarios + "/images/custom-4B01.bin --expect 0x0143C001 --json");
     ASSERT_EQ(inspect.exitCode, 0);
     nlohmann::json report = nlohmann::json::parse(inspect.output);
     EXPECT_EQ(report["imageVersion"], "0x0143C000");

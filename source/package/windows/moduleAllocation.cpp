@@ -5,8 +5,8 @@
 
 #include "../../moduleMemory.h"
 
-// Not noexcept: the implicit declaration on both targets has no exception
-// specification. The module itself never allocates with a plain new.
+// Not noexcept: it must match the implicit declaration on both targets.
+// The module itself never allocates with a plain new.
 void* operator new(size_t size)
 {
     return allocateFromHost(size);

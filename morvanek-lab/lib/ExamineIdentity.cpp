@@ -6,7 +6,7 @@
 #include <nlohmann/json.hpp>
 
 #include "DeviceStory.h"
-#include "Inspect.h"
+#include "Examine.h"
 #include "Lab.h"
 
 namespace lab {

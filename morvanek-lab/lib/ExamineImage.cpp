@@ -5,7 +5,7 @@
 #include <nlohmann/json.hpp>
 
 #include "ImageHeaderText.h"
-#include "Inspect.h"
+#include "Examine.h"
 #include "Lab.h"
 
 namespace lab {
