@@ -4,36 +4,15 @@
 #include <cstdio>
 #include <cstring>
 
+#include "../kernel/kernelUtf16.h"
 #include "simHost.h"
 
 namespace sim {
 
+// One converter for both stand-ins: the kernel's, which this library links.
 std::string utf16ToUtf8(const char16_t* text, size_t length)
 {
-    std::string out;
-    for (size_t i = 0; i < length; ++i) {
-        uint32_t c = text[i];
-        if (c >= 0xD800 && c <= 0xDBFF && i + 1 < length && text[i + 1] >= 0xDC00 && text[i + 1] <= 0xDFFF) {
-            c = 0x10000 + ((c - 0xD800) << 10) + (text[i + 1] - 0xDC00);
-            ++i;
-        }
-        if (c < 0x80) {
-            out += static_cast<char>(c);
-        } else if (c < 0x800) {
-            out += static_cast<char>(0xC0 | (c >> 6));
-            out += static_cast<char>(0x80 | (c & 0x3F));
-        } else if (c < 0x10000) {
-            out += static_cast<char>(0xE0 | (c >> 12));
-            out += static_cast<char>(0x80 | ((c >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (c & 0x3F));
-        } else {
-            out += static_cast<char>(0xF0 | (c >> 18));
-            out += static_cast<char>(0x80 | ((c >> 12) & 0x3F));
-            out += static_cast<char>(0x80 | ((c >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (c & 0x3F));
-        }
-    }
-    return out;
+    return kernel::toUtf8(text, length);
 }
 
 std::string utf16ToUtf8(const char16_t* text)
@@ -41,27 +20,12 @@ std::string utf16ToUtf8(const char16_t* text)
     if (text == nullptr) return "(null)";
     size_t length = 0;
     while (text[length] != 0) ++length;
-    return utf16ToUtf8(text, length);
+    return kernel::toUtf8(text, length);
 }
 
 std::u16string utf8ToUtf16(const std::string& text)
 {
-    std::u16string out;
-    for (size_t i = 0; i < text.size();) {
-        uint32_t c = static_cast<unsigned char>(text[i]);
-        size_t extra = c >= 0xF0 ? 3 : c >= 0xE0 ? 2 : c >= 0xC0 ? 1 : 0;
-        if (extra) c &= 0x3F >> extra;
-        ++i;
-        for (size_t k = 0; k < extra && i < text.size(); ++k, ++i) c = (c << 6) | (text[i] & 0x3F);
-        if (c >= 0x10000) {
-            c -= 0x10000;
-            out += static_cast<char16_t>(0xD800 + (c >> 10));
-            out += static_cast<char16_t>(0xDC00 + (c & 0x3FF));
-        } else {
-            out += static_cast<char16_t>(c);
-        }
-    }
-    return out;
+    return kernel::toUtf16(text);
 }
 
 std::string formatHostMessage(const char* format, va_list arguments)
