@@ -14,7 +14,7 @@
 
 #include "sim/device/enumeratedDevice.h"
 #include "sim/kernel/simKernel.h"
-#include "sim/loader/ModuleImage.h"
+#include "sim/loader/moduleImage.h"
 
 namespace {
 

@@ -8,10 +8,10 @@
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
-#include "lib/Examine.h"
-#include "lib/JsonNode.h"
-#include "lib/Lab.h"
-#include "lib/Reports.h"
+#include "lib/examine.h"
+#include "lib/jsonNode.h"
+#include "lib/lab.h"
+#include "lib/reports.h"
 
 namespace {
 

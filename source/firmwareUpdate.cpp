@@ -1,8 +1,8 @@
 // The whole job for one loader-mode device: identity, image, erase, program
 // block by block with read-back and compare, completion marker, restart.
 #include "../host/karvelk.h"
-#include "DeviceTable.h"
-#include "FirmwareHeader.h"
+#include "deviceTable.h"
+#include "firmwareHeader.h"
 #include "imageLocation.h"
 #include "moduleIdentity.h"
 #include "moduleMemory.h"

@@ -1,7 +1,7 @@
 #include "identityCheck.h"
 
 #include "../host/karvelk.h"
-#include "DeviceTable.h"
+#include "deviceTable.h"
 #include "imageLocation.h"
 #include "registryAccess.h"
 #include "serialTables.h"

@@ -4,7 +4,7 @@
 #include <stdint.h>
 
 #include "../host/karvelkStatus.h"
-#include "LoaderChannel.h"
+#include "loaderChannel.h"
 
 // Offsets in the identity page of the 16-byte identity block's fields, each
 // stored big-endian.

@@ -1,6 +1,6 @@
 #include "versionServices.h"
 
-#include "FirmwareHeader.h"
+#include "firmwareHeader.h"
 #include "imageLocation.h"
 #include "statusCodes.h"
 

@@ -4,7 +4,7 @@
 
 #include <fmt/format.h>
 
-#include "ParseParts.h"
+#include "parseParts.h"
 
 namespace lab {
 

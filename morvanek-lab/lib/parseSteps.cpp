@@ -3,7 +3,7 @@
 
 #include <fmt/format.h>
 
-#include "ParseParts.h"
+#include "parseParts.h"
 
 namespace lab {
 

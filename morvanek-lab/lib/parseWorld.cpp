@@ -7,9 +7,9 @@
 
 #include <fmt/format.h>
 
-#include "GeneratedImage.h"
-#include "ParseParts.h"
-#include "sim/kernel/regFileImport.h"
+#include "generatedImage.h"
+#include "parseParts.h"
+#include "regfile/regFileImport.h"
 #include "sim/kernel/registrySim.h"
 
 namespace lab {
@@ -233,7 +233,7 @@ RegistryPlan parseRegistry(const JsonNode& node, const std::filesystem::path& di
             // Read now, so that a malformed export is refused before anything runs.
             std::vector<uint8_t> bytes = readNamedFile(item, directory, kMaxFileSize);
             try {
-                sim::kernel::parseRegistryExport(std::string(bytes.begin(), bytes.end()), path.filename().string());
+                sim::regfile::parseRegistryExport(std::string(bytes.begin(), bytes.end()), path.filename().string());
             } catch (const std::runtime_error& problem) {
                 item.fail(problem.what());
             }

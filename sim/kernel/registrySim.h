@@ -48,6 +48,11 @@ std::vector<uint8_t> utf16leBytes(const std::string& text, bool withTerminator =
 // REG_MULTI_SZ data: each text with its NUL, then one more NUL.
 std::vector<uint8_t> multiStringBytes(const std::vector<std::string>& texts);
 
+struct RegistryKeyContent {
+    std::string path;  // full kernel path, "\\Registry\\Machine\\..."
+    std::vector<RegistryValue> values;
+};
+
 // One registry call of the module, as the stand-in saw it.
 struct RegistryCall {
     enum class Kind { createKey, queryValue };
@@ -80,12 +85,6 @@ public:
     void deleteValue(const std::string& keyPath, const std::string& name);
     std::optional<RegistryValue> value(const std::string& keyPath, const std::string& name) const;
 
-    // Registry editor export text ("Windows Registry Editor Version 5.00" or
-    // "REGEDIT4"), UTF-8 or UTF-16LE with BOM. A malformed file throws
-    // std::runtime_error naming source and line, and changes nothing.
-    void importText(const std::string& text, const std::string& sourceName);
-    void importFile(const std::string& path);
-
     // Faults: ZwCreateKey of that key, or ZwQueryValueKey of that value,
     // returns the status instead of doing its work.
     void failCreateKey(const std::string& path, NTSTATUS status);
@@ -96,9 +95,9 @@ public:
     const std::vector<RegistryCall>& calls() const { return calls_; }
     // The names of the keys that ZwCreateKey created, as the module passed them.
     std::vector<std::string> createdKeys() const;
-    // The whole hive in the registry editor's export format, which importText
-    // reads back.
-    std::string exportText() const;
+    // Every key below the machine hive that holds values or lies below its
+    // roots, with its values: what an export of the hive lists.
+    std::vector<RegistryKeyContent> contents() const;
 
 private:
     friend struct RegistryKernelSide;

@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "sim/device/enumeratedDevice.h"
-#include "tests/support/WorldTest.h"
+#include "tests/support/worldTest.h"
 
 namespace device_tests {
 

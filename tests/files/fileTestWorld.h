@@ -11,7 +11,7 @@
 #include <vector>
 
 #include "sim/kernel/kernelUtf16.h"
-#include "tests/support/WorldTest.h"
+#include "tests/support/worldTest.h"
 
 namespace files_test {
 

@@ -1,6 +1,6 @@
 // The device table: its construction and every way it can fail part way, the
 // walk over present devices, hot-plug, and the arrival filter's decisions.
-#include "tests/support/ModuleTest.h"
+#include "tests/support/moduleTest.h"
 
 namespace {
 

@@ -1,7 +1,7 @@
 // Loading, registering, starting, stopping and unloading the module.
 #include <cstring>
 
-#include "tests/support/ModuleTest.h"
+#include "tests/support/moduleTest.h"
 
 namespace {
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "morvanek-lab/lib/GeneratedImage.h"
-#include "morvanek-lab/lib/ImageHeaderText.h"
+#include "morvanek-lab/lib/generatedImage.h"
+#include "morvanek-lab/lib/imageHeaderText.h"
 
 namespace {
 

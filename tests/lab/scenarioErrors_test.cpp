@@ -6,8 +6,8 @@
 
 #include <string>
 
-#include "morvanek-lab/lib/ScenarioError.h"
-#include "morvanek-lab/lib/ScenarioParser.h"
+#include "morvanek-lab/lib/scenarioError.h"
+#include "morvanek-lab/lib/scenarioParser.h"
 
 namespace {
 

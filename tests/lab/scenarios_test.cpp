@@ -9,10 +9,10 @@
 #include <regex>
 #include <sstream>
 
-#include "morvanek-lab/lib/DeviceStory.h"
-#include "morvanek-lab/lib/Lab.h"
-#include "morvanek-lab/lib/Reports.h"
-#include "morvanek-lab/lib/ScenarioParser.h"
+#include "morvanek-lab/lib/deviceStory.h"
+#include "morvanek-lab/lib/lab.h"
+#include "morvanek-lab/lib/reports.h"
+#include "morvanek-lab/lib/scenarioParser.h"
 
 namespace {
 

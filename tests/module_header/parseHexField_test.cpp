@@ -3,7 +3,7 @@
 
 #include <string>
 
-#include "source/FirmwareHeader.h"
+#include "source/firmwareHeader.h"
 
 namespace {
 

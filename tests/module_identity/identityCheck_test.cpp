@@ -7,11 +7,11 @@
 #include <vector>
 
 #include "sim/device/enumeratedDevice.h"
-#include "source/DeviceTable.h"
-#include "source/LoaderChannel.h"
+#include "source/deviceTable.h"
+#include "source/loaderChannel.h"
 #include "source/identityCheck.h"
 #include "source/statusCodes.h"
-#include "tests/support/LoaderWorld.h"
+#include "tests/support/loaderWorld.h"
 
 namespace {
 

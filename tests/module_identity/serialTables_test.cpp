@@ -4,7 +4,7 @@
 
 #include <vector>
 
-#include "source/DeviceTable.h"
+#include "source/deviceTable.h"
 #include "source/serialTables.h"
 
 namespace {

@@ -15,9 +15,9 @@
 #include "sim/device/enumeratedDevice.h"
 #include "sim/host/simHost.h"
 #include "sim/kernel/fileStatus.h"
-#include "source/DeviceTable.h"
-#include "source/FirmwareHeader.h"
-#include "tests/support/LoaderWorld.h"
+#include "source/deviceTable.h"
+#include "source/firmwareHeader.h"
+#include "tests/support/loaderWorld.h"
 
 // This program's own ZwCreateFile, which the module's linked-in objects call
 // instead of the kernel stand-in's: it records each request exactly, and can

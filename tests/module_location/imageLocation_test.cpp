@@ -10,7 +10,7 @@
 #include "sim/kernel/kernelUtf16.h"
 #include "source/imageLocation.h"
 #include "source/statusCodes.h"
-#include "tests/support/LoaderWorld.h"
+#include "tests/support/loaderWorld.h"
 
 namespace {
 

@@ -11,7 +11,7 @@
 #include "kernel/ntkernel.h"
 #include "sim/kernel/kernelUtf16.h"
 #include "sim/kernel/simKernel.h"
-#include "tests/support/WorldTest.h"
+#include "tests/support/worldTest.h"
 
 namespace registry_test {
 

@@ -4,8 +4,10 @@
 #include <fstream>
 
 #include "moduleRegistryCalls.h"
+#include "regfile/registryText.h"
 
 using namespace registry_test;
+using namespace sim::regfile;
 
 namespace {
 
@@ -70,28 +72,28 @@ std::string utf16leWithBom(const std::string& text)
 
 TEST_F(RegistryTest, ReadsEveryValueFormOfRegeditExportsInUtf8Utf16OrRegedit4)
 {
-    registry().importText(kExport, "loader.reg");
+    importRegistryText(registry(), kExport, "loader.reg");
     expectTheExportsValues();
 
     registry().reset();
     const std::string path = std::string(MORVANEK_BINARY_DIR) + "/registry-import-test.reg";
     std::ofstream(path, std::ios::binary) << utf16leWithBom(kExport + "[HKLM\\SOFTWARE\\Grüße]\r\n@=\"Grüße\"\r\n");
-    registry().importFile(path);
+    importRegistryFile(registry(), path);
     expectTheExportsValues();
     expectValue("\\Registry\\Machine\\SOFTWARE\\grüße", "", kRegSz, utf16leBytes("Grüße"));
 
     std::ofstream(path, std::ios::binary) << utf16leWithBom(kExport + "\"Broken\"\r\n");
     try {
-        registry().importFile(path);
+        importRegistryFile(registry(), path);
         ADD_FAILURE() << "accepted";
     } catch (const std::runtime_error& error) {
         EXPECT_EQ(std::string(error.what()), path + ":23: expected '=' after value name");
     }
     std::remove(path.c_str());
-    EXPECT_THROW(registry().importFile(path), std::runtime_error);
+    EXPECT_THROW(importRegistryFile(registry(), path), std::runtime_error);
 
     // REGEDIT4 files carry text in hex lists one byte a character; the registry keeps UTF-16.
-    registry().importText("REGEDIT4\n[HKLM\\SOFTWARE\\Old]\n\"Path\"=hex(2):25,41,25,00\n\"Raw\"=hex:25,41\n",
+    importRegistryText(registry(), "REGEDIT4\n[HKLM\\SOFTWARE\\Old]\n\"Path\"=hex(2):25,41,25,00\n\"Raw\"=hex:25,41\n",
                           "old.reg");
     expectValue("\\Registry\\Machine\\SOFTWARE\\Old", "Path", kRegExpandSz, utf16leBytes("%A%"));
     expectValue("\\Registry\\Machine\\SOFTWARE\\Old", "Raw", kRegBinary, {0x25, 0x41});
@@ -118,16 +120,16 @@ TEST_F(RegistryTest, MalformedLinesAreNamedByNumberAndChangeNothing)
         {key + "\"N\xE4me\"=\"x\"\n", "t.reg:3: malformed UTF-8"},
     };
     registry().setString("\\Registry\\Machine\\SOFTWARE\\Test", "Name", "before");
-    const std::string before = registry().exportText();
+    const std::string before = exportRegistryText(registry());
     for (const auto& [text, message] : cases) {
         SCOPED_TRACE(text);
         try {
-            registry().importText(text, "t.reg");
+            importRegistryText(registry(), text, "t.reg");
             ADD_FAILURE() << "accepted";
         } catch (const std::runtime_error& error) {
             EXPECT_EQ(std::string(error.what()).substr(0, message.size()), message);
         }
-        EXPECT_EQ(registry().exportText(), before);
+        EXPECT_EQ(exportRegistryText(registry()), before);
     }
 }
 
@@ -136,25 +138,25 @@ TEST_F(RegistryTest, ExportsInRegeditsFormatAndWhatIsExportedReadsBackTheSame)
     registry().setString("\\Registry\\Machine\\SOFTWARE\\Test", "FVTPID", "4B01");
     registry().setDword("\\Registry\\Machine\\SOFTWARE\\Test", "Flags", 0xabcd);
     registry().setValue("\\Registry\\Machine\\SOFTWARE\\Test\\Sub", "", kRegBinary, {1, 2});
-    EXPECT_EQ(registry().exportText(),
+    EXPECT_EQ(exportRegistryText(registry()),
               "Windows Registry Editor Version 5.00\n"
               "\n[HKEY_LOCAL_MACHINE\\SOFTWARE]\n"
               "\n[HKEY_LOCAL_MACHINE\\SOFTWARE\\Test]\n\"Flags\"=dword:0000abcd\n\"FVTPID\"=\"4B01\"\n"
               "\n[HKEY_LOCAL_MACHINE\\SOFTWARE\\Test\\Sub]\n@=hex:01,02\n");
 
-    registry().importText(kExport, "loader.reg");
+    importRegistryText(registry(), kExport, "loader.reg");
     registry().setString(kDriverKey, "No terminator", "4B01A", false);
     registry().setString(kDriverKey, "Two lines", "a\r\nb");
     registry().setString(kDriverKey, "Quote \"and\" \\", "C:\\\"x\"");
     registry().setValue(kDriverKey, "Long", kRegBinary, std::vector<uint8_t>(100, 0x5a));
     registry().setValue(kDriverKey, "Short dword", kRegDword, {1, 2});
     registry().setValue(kDriverKey, "Empty", kRegSz, {});
-    const std::string exported = registry().exportText();
+    const std::string exported = exportRegistryText(registry());
 
     registry().reset();
-    registry().importText(exported, "exported.reg");
+    importRegistryText(registry(), exported, "exported.reg");
 
-    EXPECT_EQ(registry().exportText(), exported);
+    EXPECT_EQ(exportRegistryText(registry()), exported);
     expectTheExportsValues();
     expectValue(kDriverKey, "No terminator", kRegSz, utf16leBytes("4B01A", false));
 }

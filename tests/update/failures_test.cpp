@@ -2,7 +2,7 @@
 // can end early, with the requests the device saw up to there, the messages
 // logged (and only those), the device left in loader mode, and the image file
 // and the control stream released (the fixture finds anything left open).
-#include "UpdateWorld.h"
+#include "updateWorld.h"
 
 #include "sim/kernel/fileStatus.h"
 

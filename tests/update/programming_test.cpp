@@ -1,7 +1,7 @@
 // Updates that succeed, end to end through the device table: the requests in
 // their order, the flash they leave, and the device coming back as the
 // product, whether it was present when the module started or arrived later.
-#include "UpdateWorld.h"
+#include "updateWorld.h"
 
 namespace update_tests {
 namespace {

@@ -3,7 +3,7 @@
 #include <cstdio>
 
 #include "sim/kernel/fileStatus.h"
-#include "tests/support/LoaderWorld.h"
+#include "tests/support/loaderWorld.h"
 
 namespace {
 

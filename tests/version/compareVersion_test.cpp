@@ -1,5 +1,5 @@
 // The version queries and the check of a caller's range against the module's.
-#include "tests/support/ModuleTest.h"
+#include "tests/support/moduleTest.h"
 
 namespace {
 

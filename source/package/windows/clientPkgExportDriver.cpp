@@ -4,7 +4,7 @@
 
 #include "../../../host/karvelk.h"
 #include "../../../host/moduleRecords.h"
-#include "../../DeviceTable.h"
+#include "../../deviceTable.h"
 #include "../../moduleMemory.h"
 #include "../../statusCodes.h"
 #include "moduleExports.h"

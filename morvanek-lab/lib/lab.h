@@ -1,0 +1,52 @@
+// The lab's commands as a library: run scenarios and say what happened.
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "expectations.h"
+#include "runRecord.h"
+#include "scenario.h"
+
+namespace lab {
+
+enum ExitCode : int {
+    kExitSuccess = 0,
+    kExitExpectationFailed = 1,
+    kExitScenarioInvalid = 2,  // also a command line the lab cannot use
+    kExitLabError = 3,
+};
+
+struct MemoryRange {
+    uint16_t address = 0;
+    size_t length = 0;
+};
+
+struct RunOptions {
+    std::string modulePath;  // empty: the module built beside the lab
+    bool progress = false;   // a progress line on standard output (a terminal)
+    bool trace = false;      // the request trace, for people
+    std::vector<MemoryRange> memoryRanges;  // shown per device in the report
+};
+
+struct ScenarioResult {
+    std::string file;
+    std::optional<Scenario> scenario;
+    std::string invalid;   // the scenario could not be used
+    std::string labError;  // the lab could not run it
+    RunRecord record;
+    ExpectationOutcome expectations;
+
+    int exitCode() const;
+};
+
+ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options);
+ScenarioResult runScenarioFile(const std::filesystem::path& path, const RunOptions& options);
+// The worst of the results: a lab error, then an invalid scenario, then a failed expectation.
+int combinedExitCode(const std::vector<ScenarioResult>& results);
+
+}  // namespace lab
