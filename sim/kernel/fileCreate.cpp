@@ -10,6 +10,7 @@
 #include "fileDosPath.h"
 #include "fileWorld.h"
 #include "kernelHandles.h"
+#include "kernelLock.h"
 #include "kernelUtf16.h"
 
 namespace sim::kernel {
@@ -138,6 +139,7 @@ extern "C" NTSTATUS ZwCreateFile(HANDLE* fileHandle, uint32_t desiredAccess, OBJ
                                  uint32_t /*fileAttributes: unused by an open*/, uint32_t shareAccess,
                                  uint32_t createDisposition, uint32_t createOptions, void* eaBuffer, uint32_t eaLength)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     using namespace sim::kernel;
     if (fileHandle == nullptr || ioStatus == nullptr)
         return misuse(fileStatus::invalidParameter, "no handle or I/O status block to fill");

@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "kernelHandles.h"
+#include "kernelLock.h"
 #include "kernelUtf16.h"
 #include "registryKeyTree.h"
 #include "registrySim.h"
@@ -193,6 +194,7 @@ extern "C" NTSTATUS ZwCreateKey(HANDLE* keyHandle, uint32_t desiredAccess, OBJEC
                                 uint32_t /*titleIndex: ignored by the kernel*/, UNICODE_STRING* keyClass,
                                 uint32_t createOptions, uint32_t* disposition)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     return sim::kernel::RegistryKernelSide::createKey(sim::kernel::registry(), keyHandle, desiredAccess,
                                                       objectAttributes, keyClass, createOptions, disposition);
 }
@@ -200,6 +202,7 @@ extern "C" NTSTATUS ZwCreateKey(HANDLE* keyHandle, uint32_t desiredAccess, OBJEC
 extern "C" NTSTATUS ZwQueryValueKey(HANDLE keyHandle, UNICODE_STRING* valueName, int informationClass,
                                     void* information, uint32_t length, uint32_t* resultLength)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     return sim::kernel::RegistryKernelSide::queryValue(sim::kernel::registry(), keyHandle, valueName,
                                                        informationClass, information, length, resultLength);
 }

@@ -1,0 +1,225 @@
+// morvanek-usb against emulated loader-mode devices behind umockdev: the same
+// module, the same devices as the lab, a real libusb in between.
+#include <signal.h>
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <fstream>
+#include <thread>
+
+#include "usbWorld.h"
+
+namespace usb_testing {
+namespace {
+
+using testing_support::makeImage;
+
+constexpr uint32_t kSerialNumber = 0x00012345;
+
+struct LoaderVariant {
+    const char* name;
+    uint16_t loaderProductId;
+    uint16_t productId;
+    size_t imageSize;
+};
+
+class FullUpdate : public UsbWorld, public ::testing::WithParamInterface<LoaderVariant> {};
+
+TEST_P(FullUpdate, ProgramsTheDeviceAsTheLabDoesAndSeesItComeBackAsTheProduct)
+{
+    const LoaderVariant& variant = GetParam();
+    writeDefaultImage(variant.productId, makeImage(variant.imageSize));
+    sim::EmulatedDeviceOptions options = deviceWithIdentity(variant.loaderProductId, variant.productId, kSerialNumber);
+    std::vector<sim::RequestRecord> expected = labTrace(options);
+    auto device = plugIn(options, "00012345");
+
+    UsbRun run = runUsb({"once"});
+
+    ASSERT_EQ(run.exitCode, 0) << run.errors;
+    EXPECT_EQ(traceDifference(expected, device->trace), "");
+    EXPECT_TRUE(device->completionMarkerInPlace());
+    char product[16];
+    std::snprintf(product, sizeof product, "5C1D:%04X", variant.productId);
+    char loader[16];
+    std::snprintf(loader, sizeof loader, "5C1D:%04X", variant.loaderProductId);
+    EXPECT_EQ(bus->history(), (std::vector<std::string>{std::string("add 1-1 ") + loader, "remove 1-1",
+                                                        std::string("add 1-1 ") + product}));
+    // The product's arrival reaches the module too, which leaves it alone.
+    EXPECT_EQ(run.outcomeOf("1-1"), "updated,ignored");
+    ASSERT_EQ(run.eventsOf("left").size(), 1u);
+    EXPECT_EQ(run.eventsOf("left")[0]["text"], "left the bus to restart");
+    EXPECT_EQ(run.eventsOf("arrived").back()["text"], "back after its restart");
+    EXPECT_EQ(run.eventsOf("log").size(), 0u);
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"].size(), 0u);
+}
+
+INSTANTIATE_TEST_SUITE_P(BothLoaders, FullUpdate,
+                         ::testing::Values(LoaderVariant{"loader4A10LargestImage", 0x4A10, 0x4B01, 0x3400},
+                                           LoaderVariant{"loader4A20", 0x4A20, 0x4B02, 3000}),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+struct FaultCase {
+    const char* name;
+    sim::DeviceFaults faults;
+    std::vector<std::string> history;
+    const char* statusInLog;
+};
+
+sim::DeviceFaults stallAt(uint64_t request)
+{
+    sim::DeviceFaults faults;
+    faults.stallRequests = {request};
+    return faults;
+}
+
+sim::DeviceFaults unplugAt(uint64_t request)
+{
+    sim::DeviceFaults faults;
+    faults.unplugAtRequest = request;
+    return faults;
+}
+
+class FaultWhileProgramming : public UsbWorld, public ::testing::WithParamInterface<FaultCase> {};
+
+TEST_P(FaultWhileProgramming, LeavesTheDeviceInLoaderModeAndNothingBehind)
+{
+    const FaultCase& fault = GetParam();
+    writeDefaultImage(0x4B01, makeImage(0x3400));
+    sim::EmulatedDeviceOptions options = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber);
+    options.faults = fault.faults;
+    std::vector<sim::RequestRecord> expected = labTrace(options);
+    auto device = plugIn(options);
+
+    UsbRun run = runUsb({"once"});
+
+    EXPECT_EQ(run.exitCode, 1) << run.errors;
+    EXPECT_EQ(traceDifference(expected, device->trace), "");
+    EXPECT_FALSE(device->completionMarkerInPlace());
+    EXPECT_EQ(run.outcomeOf("1-1"), "failed");
+    ASSERT_EQ(run.eventsOf("log").size(), 1u);
+    EXPECT_EQ(run.eventsOf("log")[0]["location"], "source\\DeviceTable:451 - ");
+    EXPECT_NE(run.eventsOf("log")[0]["message"].get<std::string>().find(fault.statusInLog), std::string::npos);
+    EXPECT_EQ(run.eventsOf("log")[0]["device"]["busPath"], "1-1");
+    EXPECT_TRUE(bus->waitForHistory(fault.history.size(), 2000));
+    EXPECT_EQ(bus->history(), fault.history);
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"].size(), 0u);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    StallAndDisconnect, FaultWhileProgramming,
+    ::testing::Values(FaultCase{"stall", stallAt(60), {"add 1-1 5C1D:4A10"}, "Status = -53001"},
+                      FaultCase{"disconnect", unplugAt(60), {"add 1-1 5C1D:4A10", "remove 1-1"}, "Status = -53002"}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(UsbWorld, UpdatesSeveralDevicesAtOnce)
+{
+    const uint16_t products[] = {0x4B01, 0x4B02, 0x4B03};
+    const uint16_t loaders[] = {0x4A10, 0x4A20, 0x4A10};
+    std::vector<std::vector<sim::RequestRecord>> expected;
+    std::vector<std::shared_ptr<sim::PhysicalDevice>> devices;
+    for (int i = 0; i < 3; ++i) {
+        writeDefaultImage(products[i], makeImage(2000, static_cast<uint8_t>(i + 1)));
+        sim::EmulatedDeviceOptions options = deviceWithIdentity(loaders[i], products[i], kSerialNumber + i);
+        expected.push_back(labTrace(options));
+        devices.push_back(plugIn(options));
+    }
+
+    UsbRun run = runUsb({"once"});
+
+    ASSERT_EQ(run.exitCode, 0) << run.errors;
+    for (int i = 0; i < 3; ++i) {
+        SCOPED_TRACE("device " + std::to_string(i + 1));
+        EXPECT_EQ(traceDifference(expected[i], devices[i]->trace), "");
+        EXPECT_EQ(run.outcomeOf("1-" + std::to_string(i + 1)), "updated,ignored");
+    }
+}
+
+struct SelectionCase {
+    const char* name;
+    std::vector<std::string> arguments;
+    const char* chosen;  // bus path of the one device updated
+};
+
+class Selection : public UsbWorld, public ::testing::WithParamInterface<SelectionCase> {};
+
+TEST_P(Selection, UpdatesOnlyTheDeviceChosen)
+{
+    writeDefaultImage(0x4B01, makeImage(1000));
+    writeDefaultImage(0x4B02, makeImage(1000));
+    auto first = plugIn(deviceWithIdentity(0x4A10, 0x4B01, 0xA1), "A1");
+    auto second = plugIn(deviceWithIdentity(0x4A10, 0x4B02, 0xB2), "B2");
+
+    std::vector<std::string> arguments = {"once"};
+    arguments.insert(arguments.end(), GetParam().arguments.begin(), GetParam().arguments.end());
+    UsbRun run = runUsb(arguments);
+
+    ASSERT_EQ(run.exitCode, 0) << run.errors;
+    bool firstChosen = std::string(GetParam().chosen) == "1-1";
+    EXPECT_EQ(first->completionMarkerInPlace(), firstChosen);
+    EXPECT_EQ(second->completionMarkerInPlace(), !firstChosen);
+    EXPECT_TRUE((firstChosen ? second : first)->trace.empty());
+    EXPECT_EQ(run.outcomeOf(firstChosen ? "1-2" : "1-1"), "");
+}
+
+INSTANTIATE_TEST_SUITE_P(BySerialOrBusPath, Selection,
+                         ::testing::Values(SelectionCase{"serial", {"--serial", "B2"}, "1-2"},
+                                           SelectionCase{"busPath", {"--device", "1-1"}, "1-1"}),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(UsbWorld, WatchUpdatesADeviceThatArrivesAndStopsOnSigterm)
+{
+    writeDefaultImage(0x4B01, makeImage(1500));
+    pid_t child = startUsb({"watch"});
+    // Give the program time to load the module and listen; an arrival before
+    // that is found at start instead, which is no less valid.
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    auto device = plugIn(deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber));
+    bool cameBack = bus->waitForHistory(3, 20000);
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+
+    UsbRun run = finishUsb(child, SIGTERM);
+
+    EXPECT_TRUE(cameBack);
+    EXPECT_EQ(run.exitCode, 0) << run.errors;
+    EXPECT_TRUE(device->completionMarkerInPlace());
+    EXPECT_EQ(run.outcomeOf("1-1"), "updated,ignored");
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"].size(), 0u);
+}
+
+TEST_F(UsbWorld, ReportsThatNoDeviceIsThere)
+{
+    UsbRun run = runUsb({"once"});
+    EXPECT_EQ(run.exitCode, 4) << run.errors;
+}
+
+struct InvalidCase {
+    const char* name;
+    std::vector<std::string> arguments;
+    const char* message;
+};
+
+class InvalidSetting : public UsbWorld, public ::testing::WithParamInterface<InvalidCase> {};
+
+TEST_P(InvalidSetting, IsRefusedBeforeAnythingRuns)
+{
+    std::ofstream(outputFolder + "/bad.reg") << "Windows Registry Editor Version 5.00\n\n[HKEY_LOCAL_MACHINE\\X]\n\"a\"=zz\n";
+    std::vector<std::string> arguments = {"once"};
+    for (std::string argument : GetParam().arguments) {
+        if (argument == "BAD_REG") argument = outputFolder + "/bad.reg";
+        arguments.push_back(argument);
+    }
+    UsbRun run = runUsb(arguments);
+    EXPECT_EQ(run.exitCode, 2);
+    EXPECT_NE(run.errors.find(GetParam().message), std::string::npos) << run.errors;
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    CommandLineAndFiles, InvalidSetting,
+    ::testing::Values(InvalidCase{"malformedRegFile", {"--registry", "BAD_REG"}, "bad.reg:4"},
+                      InvalidCase{"missingDriveFolder", {"--drive", "D=/nonexistent/folder"}, "is not a folder"},
+                      InvalidCase{"busPathNotAPath", {"--device", "usb1"}, "is not a bus path"}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+}  // namespace
+}  // namespace usb_testing
