@@ -170,7 +170,7 @@ INSTANTIATE_TEST_SUITE_P(BySerialOrBusPath, Selection,
 TEST_F(UsbWorld, WatchUpdatesADeviceThatArrivesAndStopsOnSigterm)
 {
     writeDefaultImage(0x4B01, makeImage(1500));
-    pid_t child = startUsb({"watch"});
+    auto program = startUsb({"watch"});
     // Give the program time to load the module and listen; an arrival before
     // that is found at start instead, which is no less valid.
     std::this_thread::sleep_for(std::chrono::milliseconds(300));
@@ -178,7 +178,7 @@ TEST_F(UsbWorld, WatchUpdatesADeviceThatArrivesAndStopsOnSigterm)
     bool cameBack = bus->waitForHistory(3, 20000);
     std::this_thread::sleep_for(std::chrono::milliseconds(300));
 
-    UsbRun run = finishUsb(child, SIGTERM);
+    UsbRun run = finishUsb(*program, SIGTERM);
 
     EXPECT_TRUE(cameBack);
     EXPECT_EQ(run.exitCode, 0) << run.errors;

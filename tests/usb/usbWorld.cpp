@@ -1,11 +1,5 @@
 #include "usbWorld.h"
 
-#include <fcntl.h>
-#include <signal.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
-#include <cstring>
 #include <fstream>
 #include <sstream>
 
@@ -14,38 +8,8 @@
 namespace usb_testing {
 
 namespace {
-
-std::string readFile(const std::string& path)
-{
-    std::ifstream in(path);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
-
-// umockdev's test bed sends udev events through libudev, which must see the
-// test bed's /sys as the program does: so this test program, too, runs under
-// umockdev's preload, as umockdev-wrapper would start it.
-struct UnderUmockdev {
-    UnderUmockdev()
-    {
-        const char* preload = std::getenv("LD_PRELOAD");
-        if (preload != nullptr && std::strstr(preload, "libumockdev-preload") != nullptr) return;
-        std::ifstream commandLine("/proc/self/cmdline", std::ios::binary);
-        std::vector<std::string> words;
-        for (std::string word; std::getline(commandLine, word, '\0');) words.push_back(word);
-        std::vector<char*> argv;
-        for (std::string& word : words) argv.push_back(word.data());
-        argv.push_back(nullptr);
-        std::string preloads = std::string("libumockdev-preload.so.0") + (preload != nullptr ? std::string(":") + preload : "");
-        setenv("LD_PRELOAD", preloads.c_str(), 1);
-        // The preload comes before the sanitizer's runtime, which must accept that.
-        setenv("ASAN_OPTIONS", "verify_asan_link_order=0", 1);
-        execv("/proc/self/exe", argv.data());
-        // Without the preload only the test bed's udev events are missing; the tests say so.
-    }
-} underUmockdev;
-
+// Before any test makes a bed: see runUnderUmockdev.
+const bool gUnderUmockdev = (usbtestbed::runUnderUmockdev(), true);
 }  // namespace
 
 std::vector<nlohmann::json> UsbRun::eventsOf(const std::string& kind) const
@@ -90,7 +54,7 @@ std::shared_ptr<sim::PhysicalDevice> UsbWorld::plugIn(const sim::EmulatedDeviceO
     return device;
 }
 
-pid_t UsbWorld::startUsb(const std::vector<std::string>& arguments)
+std::unique_ptr<usbtestbed::ProgramRun> UsbWorld::startUsb(const std::vector<std::string>& arguments)
 {
     std::string registryFile = outputFolder + "/machine.reg";
     std::ofstream(registryFile) << sim::regfile::exportRegistryText(sim::kernel::registry());
@@ -99,35 +63,16 @@ pid_t UsbWorld::startUsb(const std::vector<std::string>& arguments)
     for (const std::string& extra : {std::string("--json"), std::string("--no-progress"), "--registry=" + registryFile,
                                      "--drive=C=" + driveC.string()})
         command.push_back(extra);
-
-    std::string folder = bus->folder();
-    std::string out = outputFolder + "/out.jsonl";
-    std::string err = outputFolder + "/err.txt";
-    pid_t child = fork();
-    if (child == 0) {
-        setenv("UMOCKDEV_DIR", folder.c_str(), 1);
-        int outFd = open(out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-        int errFd = open(err.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-        dup2(outFd, 1);
-        dup2(errFd, 2);
-        std::vector<char*> argv;
-        for (std::string& word : command) argv.push_back(word.data());
-        argv.push_back(nullptr);
-        execv(argv[0], argv.data());
-        _exit(127);
-    }
-    return child;
+    return std::make_unique<usbtestbed::ProgramRun>(command, bus->folder(), outputFolder);
 }
 
-UsbRun UsbWorld::finishUsb(pid_t child, int signal)
+UsbRun UsbWorld::finishUsb(usbtestbed::ProgramRun& program, int signal)
 {
-    if (signal != 0) kill(child, signal);
-    int status = 0;
-    waitpid(child, &status, 0);
+    usbtestbed::ProgramOutput output = program.finish(signal);
     UsbRun run;
-    run.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-    run.errors = readFile(outputFolder + "/err.txt");
-    std::istringstream lines(readFile(outputFolder + "/out.jsonl"));
+    run.exitCode = output.exitCode;
+    run.errors = output.errors;
+    std::istringstream lines(output.out);
     for (std::string line; std::getline(lines, line);) {
         if (!line.empty()) run.events.push_back(nlohmann::json::parse(line));
     }
@@ -136,7 +81,7 @@ UsbRun UsbWorld::finishUsb(pid_t child, int signal)
 
 UsbRun UsbWorld::runUsb(const std::vector<std::string>& arguments)
 {
-    return finishUsb(startUsb(arguments), 0);
+    return finishUsb(*startUsb(arguments), 0);
 }
 
 std::vector<sim::RequestRecord> UsbWorld::labTrace(const sim::EmulatedDeviceOptions& options)

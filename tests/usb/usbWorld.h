@@ -4,8 +4,6 @@
 // the lab's host in this process, to compare what each device was asked.
 #pragma once
 
-#include <sys/types.h>
-
 #include <memory>
 #include <string>
 #include <vector>
@@ -14,6 +12,7 @@
 
 #include "tests/support/loaderWorld.h"
 #include "usb/testbed/emulatedBus.h"
+#include "usb/testbed/programRun.h"
 
 namespace usb_testing {
 
@@ -37,8 +36,8 @@ protected:
     UsbRun runUsb(const std::vector<std::string>& arguments);
     // The same, started in the background, for watch; finishUsb sends the
     // signal given (0: none) and collects it.
-    pid_t startUsb(const std::vector<std::string>& arguments);
-    UsbRun finishUsb(pid_t child, int signal);
+    std::unique_ptr<usbtestbed::ProgramRun> startUsb(const std::vector<std::string>& arguments);
+    UsbRun finishUsb(usbtestbed::ProgramRun& program, int signal);
 
     // What the device would be asked through the lab's host: the module run
     // in this process against a device made from the same options.
