@@ -187,6 +187,45 @@ TEST_F(UsbWorld, WatchUpdatesADeviceThatArrivesAndStopsOnSigterm)
     EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"].size(), 0u);
 }
 
+struct StopCase {
+    const char* name;
+    int signals;
+    int exitCode;
+    const char* outcome;
+    bool updated;
+};
+
+class StopWhileUpdating : public UsbWorld, public ::testing::WithParamInterface<StopCase> {};
+
+// One SIGINT lets the running update finish; a second abandons it, and the
+// device stays in loader mode.
+TEST_P(StopWhileUpdating, FinishesOrAbandonsTheRunningUpdate)
+{
+    bus = std::make_unique<usbtestbed::EmulatedBus>(1.0);  // the timing model in real time: about a second
+    writeDefaultImage(0x4B01, makeImage(0x3400));
+    sim::EmulatedDeviceOptions options = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber);
+    options.timing = sim::TimingModel::fullSpeed();
+    auto device = plugIn(options);
+    auto program = startUsb({"once"});
+    std::this_thread::sleep_for(std::chrono::milliseconds(400));
+    for (int i = 1; i < GetParam().signals; ++i) {
+        program->signal(SIGINT);
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    }
+
+    UsbRun run = finishUsb(*program, SIGINT);
+
+    EXPECT_EQ(run.exitCode, GetParam().exitCode) << run.errors;
+    EXPECT_EQ(run.outcomeOf("1-1").substr(0, std::string(GetParam().outcome).size()), GetParam().outcome);
+    EXPECT_EQ(device->completionMarkerInPlace(), GetParam().updated);
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"].size(), 0u);
+}
+
+INSTANTIATE_TEST_SUITE_P(Signals, StopWhileUpdating,
+                         ::testing::Values(StopCase{"oneSignalFinishes", 1, 0, "updated", true},
+                                           StopCase{"secondSignalAbandons", 2, 1, "abandoned", false}),
+                         [](const auto& info) { return std::string(info.param.name); });
+
 TEST_F(UsbWorld, ReportsThatNoDeviceIsThere)
 {
     UsbRun run = runUsb({"once"});

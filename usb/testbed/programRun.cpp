@@ -61,6 +61,11 @@ ProgramRun::ProgramRun(const std::vector<std::string>& command, const std::strin
     }
 }
 
+void ProgramRun::signal(int number)
+{
+    kill(child_, number);
+}
+
 ProgramOutput ProgramRun::finish(int signal)
 {
     if (signal != 0) kill(child_, signal);

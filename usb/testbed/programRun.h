@@ -25,6 +25,7 @@ public:
     // Starts the command (program first) with UMOCKDEV_DIR set to the bus
     // folder; standard output and error go to files in the output folder.
     ProgramRun(const std::vector<std::string>& command, const std::string& busFolder, const std::string& outputFolder);
+    void signal(int number);
     // Sends the signal (0: none) and waits for the program to end.
     ProgramOutput finish(int signal = 0);
 
