@@ -201,7 +201,10 @@ class StopWhileUpdating : public UsbWorld, public ::testing::WithParamInterface<
 // device stays in loader mode.
 TEST_P(StopWhileUpdating, FinishesOrAbandonsTheRunningUpdate)
 {
-    bus = std::make_unique<usbtestbed::EmulatedBus>(1.0);  // the timing model in real time: about a second
+    // The timing model in real time: the update takes about a second. One bed
+    // at a time: umockdev points the process at the newest.
+    bus.reset();
+    bus = std::make_unique<usbtestbed::EmulatedBus>(1.0);
     writeDefaultImage(0x4B01, makeImage(0x3400));
     sim::EmulatedDeviceOptions options = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber);
     options.timing = sim::TimingModel::fullSpeed();

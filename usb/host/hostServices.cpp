@@ -1,5 +1,5 @@
 // The host library's plain functions over the shared state: registration,
-// memory, the event log and debug lines, text conversion.
+// memory, the event log and debug lines.
 #include <cstdarg>
 #include <cstdio>
 
@@ -80,28 +80,4 @@ int32_t ssprintf(const char* format, ...)
     int32_t length = static_cast<int32_t>(event.text.size());
     usbhost::emit(std::move(event));
     return length;
-}
-
-uint32_t kvlASCIIToU32Base16(const char* text)
-{
-    uint32_t value = 0;
-    for (const char* p = text; p != nullptr && *p != 0; ++p) {
-        char c = *p;
-        uint32_t digit;
-        if (c >= '0' && c <= '9') digit = static_cast<uint32_t>(c - '0');
-        else if (c >= 'a' && c <= 'f') digit = static_cast<uint32_t>(c - 'a' + 10);
-        else if (c >= 'A' && c <= 'F') digit = static_cast<uint32_t>(c - 'A' + 10);
-        else break;
-        value = (value << 4) | digit;
-    }
-    return value;
-}
-
-char* tSSVersion::toString(char* text) const
-{
-    static const char kPhases[] = {'d', 'a', 'b', 'f'};
-    uint32_t v = packed_;
-    std::snprintf(text, 16, "%u.%u.%u%c%u", v >> 24, (v >> 20) & 0xF, (v >> 16) & 0xF, kPhases[(v >> 14) & 3],
-                  v & 0x3FFF);
-    return text;
 }

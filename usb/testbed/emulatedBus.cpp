@@ -191,7 +191,8 @@ void EmulatedBus::runActions()
         auto next = std::min_element(actions_.begin(), actions_.end(),
                                      [](const Action& a, const Action& b) { return a.due < b.due; });
         if (next->due > std::chrono::steady_clock::now()) {
-            actionsChanged_.wait_until(lock, next->due);
+            auto due = next->due;  // a copy: the list may grow while this waits
+            actionsChanged_.wait_until(lock, due);
             continue;
         }
         std::function<void()> work = std::move(next->work);
