@@ -342,6 +342,7 @@ int Node::vendorRequest(const uint8_t* setup, uint8_t* data, int& actualLength)
     std::chrono::microseconds spent{0};
     tStatus outcome;
     bool stillHere;
+    size_t crossed = request.length;  // bytes of the data stage that crossed the bus
     {
         std::lock_guard<std::mutex> deviceLock(bus_.deviceMutex);
         // Only the loader speaks the protocol; the product's firmware stalls it.
@@ -351,6 +352,9 @@ int Node::vendorRequest(const uint8_t* setup, uint8_t* data, int& actualLength)
         outcome = hardware_->serve(request, 0);
         spent = hardware_->elapsed - before;
         stillHere = hardware_->current() == enumeration_;
+        // A device may end an IN data stage early; its trace holds what it sent.
+        if ((request.bmRequestType & 0x80) != 0 && hardware_->traceEnabled && !hardware_->trace.empty())
+            crossed = hardware_->trace.back().data.size();
     }
     if (bus_.timeScale > 0 && spent.count() > 0)
         std::this_thread::sleep_for(std::chrono::duration<double, std::micro>(spent.count() * bus_.timeScale));
@@ -362,7 +366,7 @@ int Node::vendorRequest(const uint8_t* setup, uint8_t* data, int& actualLength)
         }
     }
     if (outcome < 0) return -errnoOf(outcome);
-    actualLength = static_cast<int>(request.length);
+    actualLength = static_cast<int>(crossed);
     return 0;
 }
 
