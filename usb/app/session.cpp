@@ -182,10 +182,12 @@ int runSession(const ProgramOptions& options, Reporter& reporter)
         }
     }
     std::vector<std::string> left = usbhost::leftovers();
+    for (const std::string& handle : sim::kernel::openHandleDescriptions()) left.push_back("open kernel handle: " + handle);
+    for (const std::string& misuse : sim::kernel::misuseReports()) reporter.error("misuse of the kernel by the module: " + misuse);
     usbhost::shutdown();
 
     int code = options.mode == Mode::once ? onceExitCode(updates, comebacks) : kExitSuccess;
-    if (!left.empty() || usbhost::misuseCount() != 0) code = kExitCannotRun;
+    if (!left.empty() || usbhost::misuseCount() != 0 || !sim::kernel::misuseReports().empty()) code = kExitCannotRun;
     reporter.summary(code, updates, comebacks, left);
     return code;
 }
