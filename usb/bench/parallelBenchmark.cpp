@@ -14,6 +14,8 @@
 #include <fstream>
 #include <random>
 
+#include <sys/resource.h>
+
 #include "regfile/registryText.h"
 #include "sim/kernel/simKernel.h"
 #include "usb/testbed/emulatedBus.h"
@@ -37,9 +39,24 @@ struct Setup {
     std::filesystem::path driveC;
 };
 
-// Returns seconds of wall time for one run of morvanek-usb once over `count` devices.
-double updateDevices(const Setup& setup, int count)
+double cpuSeconds(int who)
 {
+    rusage usage{};
+    getrusage(who, &usage);
+    return static_cast<double>(usage.ru_utime.tv_sec + usage.ru_stime.tv_sec) +
+           static_cast<double>(usage.ru_utime.tv_usec + usage.ru_stime.tv_usec) / 1e6;
+}
+
+struct Cpu {
+    double program = 0;  // morvanek-usb
+    double bus = 0;      // the emulated bus: umockdev's handler and the devices
+};
+
+// Returns seconds of wall time for one run of morvanek-usb once over `count` devices.
+double updateDevices(const Setup& setup, int count, Cpu& cpu)
+{
+    double programBefore = cpuSeconds(RUSAGE_CHILDREN);
+    double busBefore = cpuSeconds(RUSAGE_SELF);
     usbtestbed::EmulatedBus bus(1.0);
     std::vector<std::shared_ptr<sim::PhysicalDevice>> devices;
     for (int i = 0; i < count; ++i) {
@@ -60,6 +77,8 @@ double updateDevices(const Setup& setup, int count)
                                bus.folder(), setup.folder.string());
     usbtestbed::ProgramOutput output = run.finish();
     double seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+    cpu.program = cpuSeconds(RUSAGE_CHILDREN) - programBefore;
+    cpu.bus = cpuSeconds(RUSAGE_SELF) - busBefore;
     int updated = 0;
     for (const auto& device : devices) updated += device->completionMarkerInPlace() ? 1 : 0;
     if (output.exitCode != 0 || updated != count) {
@@ -95,9 +114,10 @@ int main(int argc, char** argv)
 
     int runs = argc > 3 ? std::max(1, std::atoi(argv[3])) : 3;
     std::vector<double> one, many;
+    Cpu oneCpu, manyCpu;
     for (int run = 0; run < runs; ++run) {
-        one.push_back(updateDevices(setup, 1));
-        many.push_back(updateDevices(setup, count));
+        one.push_back(updateDevices(setup, 1, oneCpu));
+        many.push_back(updateDevices(setup, count, manyCpu));
     }
     std::sort(one.begin(), one.end());
     std::sort(many.begin(), many.end());
@@ -106,6 +126,10 @@ int main(int argc, char** argv)
     std::printf("%d devices:    best %.3f s, median %.3f s\n", count, many.front(), many[many.size() / 2]);
     std::printf("ratio:        best %.2f, median %.2f\n", many.front() / one.front(),
                 many[many.size() / 2] / one[one.size() / 2]);
+    std::printf("processor time of the last run: one device %.3f s (program %.3f, bus %.3f), %d devices %.3f s "
+                "(program %.3f, bus %.3f)\n",
+                oneCpu.program + oneCpu.bus, oneCpu.program, oneCpu.bus, count, manyCpu.program + manyCpu.bus,
+                manyCpu.program, manyCpu.bus);
     std::error_code ignored;
     std::filesystem::remove_all(setup.folder, ignored);
     return 0;
