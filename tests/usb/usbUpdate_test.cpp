@@ -135,6 +135,25 @@ TEST_F(UsbWorld, UpdatesSeveralDevicesAtOnce)
     }
 }
 
+// Flash programming only clears bits: a marker written over image bytes that
+// are not FF FF does not take, and the device restarts into its loader again.
+TEST_F(UsbWorld, ReportsADeviceThatComesBackInLoaderMode)
+{
+    std::vector<uint8_t> image = makeImage(1000);
+    image[6] = 0x12;
+    writeDefaultImage(0x4B01, image);
+    auto device = plugIn(deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber));
+
+    UsbRun run = runUsb({"once"});
+
+    EXPECT_EQ(run.exitCode, 1) << run.errors;
+    EXPECT_EQ(run.outcomeOf("1-1"), "updated");
+    EXPECT_EQ(bus->history(), (std::vector<std::string>{"add 1-1 5C1D:4A10", "remove 1-1", "add 1-1 5C1D:4A10"}));
+    ASSERT_EQ(run.eventsOf("skipped").size(), 1u);
+    EXPECT_EQ(run.eventsOf("skipped")[0]["text"], "came back in loader mode; not updated again in once mode");
+    EXPECT_EQ(run.eventsOf("summary").at(0)["backInLoaderMode"], 1);
+}
+
 struct SelectionCase {
     const char* name;
     std::vector<std::string> arguments;
