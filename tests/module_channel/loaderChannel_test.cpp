@@ -215,8 +215,12 @@ TEST_F(LoaderChannelTest, VerifyNamesTheFirstDifferenceOrWhatWasNotDelivered)
         int32_t difference;
     };
     const Case cases[] = {
-        {"equal", -1, {}, -1},       {"first byte", 0, {}, 0},          {"third chunk", 133, {}, 133},
-        {"last byte", 199, {}, 199},   {"nothing delivered", -1, {1, 0}, 0}, {"second chunk short", -1, {2, 35}, 64 + 35},
+        {"equal", -1, {}, -1},
+        {"first byte", 0, {}, 0},
+        {"third chunk", 133, {}, 133},
+        {"last byte", 199, {}, 199},
+        {"nothing delivered", -1, {1, 0}, 0},
+        {"second chunk short", -1, {2, 35}, 64 + 35},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.what);
@@ -236,6 +240,7 @@ TEST_F(LoaderChannelTest, VerifyNamesTheFirstDifferenceOrWhatWasNotDelivered)
         EXPECT_EQ(status, 0);
         ASSERT_EQ(device.hardware().trace.size(), 4u);
         for (uint32_t i = 0; i < 4; ++i)
-            expectSetup(device.hardware().trace[i], 0xC0, 0xB0, 0, static_cast<uint16_t>(0x0400 + 64 * i), i < 3 ? 64 : 8);
+            expectSetup(device.hardware().trace[i], 0xC0, 0xB0, 0, static_cast<uint16_t>(0x0400 + 64 * i),
+                        i < 3 ? 64 : 8);
     }
 }
