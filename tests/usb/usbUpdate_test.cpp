@@ -154,6 +154,46 @@ TEST_F(UsbWorld, ReportsADeviceThatComesBackInLoaderMode)
     EXPECT_EQ(run.eventsOf("summary").at(0)["backInLoaderMode"], 1);
 }
 
+// Readers share the image file, so two devices of one product arriving
+// together are both programmed from it.
+TEST_F(UsbWorld, UpdatesTwoDevicesOfOneProductAtOnce)
+{
+    bus.reset();
+    bus = std::make_unique<usbtestbed::EmulatedBus>(1.0);  // long enough updates to overlap for sure
+    writeDefaultImage(0x4B01, makeImage(3000));
+    sim::EmulatedDeviceOptions first = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber);
+    sim::EmulatedDeviceOptions second = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber + 1);
+    first.timing = second.timing = sim::TimingModel::fullSpeed();
+    std::vector<sim::RequestRecord> expected = labTrace(first);
+    auto one = plugIn(first);
+    auto other = plugIn(second);
+
+    UsbRun run = runUsb({"once"});
+
+    ASSERT_EQ(run.exitCode, 0) << run.errors;
+    EXPECT_EQ(traceDifference(expected, one->trace), "");
+    EXPECT_TRUE(one->completionMarkerInPlace());
+    EXPECT_TRUE(other->completionMarkerInPlace());
+    EXPECT_EQ(run.eventsOf("log").size(), 0u);
+}
+
+// The module cannot see how many bytes an IN data stage brought: the host
+// fails a short one rather than leave stale bytes in the buffer.
+TEST_F(UsbWorld, FailsAReadThatEndsEarly)
+{
+    writeDefaultImage(0x4B01, makeImage(1000));
+    sim::EmulatedDeviceOptions options = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber);
+    options.faults.shortReads = {{5, 10}};  // the second read-back of the first block
+    auto device = plugIn(options);
+
+    UsbRun run = runUsb({"once"});
+
+    EXPECT_EQ(run.exitCode, 1) << run.errors;
+    EXPECT_EQ(run.outcomeOf("1-1"), "failed");
+    EXPECT_EQ(run.eventsOf("update").at(0)["firstFailure"], -53005);
+    EXPECT_FALSE(device->completionMarkerInPlace());
+}
+
 struct SelectionCase {
     const char* name;
     std::vector<std::string> arguments;
