@@ -11,10 +11,14 @@ uint32_t kvlASCIIToU32Base16(const char* text)
     for (const char* p = text; p != nullptr && *p != 0; ++p) {
         char c = *p;
         uint32_t digit;
-        if (c >= '0' && c <= '9') digit = c - '0';
-        else if (c >= 'a' && c <= 'f') digit = c - 'a' + 10;
-        else if (c >= 'A' && c <= 'F') digit = c - 'A' + 10;
-        else break;
+        if (c >= '0' && c <= '9')
+            digit = c - '0';
+        else if (c >= 'a' && c <= 'f')
+            digit = c - 'a' + 10;
+        else if (c >= 'A' && c <= 'F')
+            digit = c - 'A' + 10;
+        else
+            break;
         value = (value << 4) | digit;
     }
     return value;

@@ -304,7 +304,8 @@ class InvalidSetting : public UsbWorld, public ::testing::WithParamInterface<Inv
 
 TEST_P(InvalidSetting, IsRefusedBeforeAnythingRuns)
 {
-    std::ofstream(outputFolder + "/bad.reg") << "Windows Registry Editor Version 5.00\n\n[HKEY_LOCAL_MACHINE\\X]\n\"a\"=zz\n";
+    std::ofstream(outputFolder + "/bad.reg")
+        << "Windows Registry Editor Version 5.00\n\n[HKEY_LOCAL_MACHINE\\X]\n\"a\"=zz\n";
     std::vector<std::string> arguments = {"once"};
     for (std::string argument : GetParam().arguments) {
         if (argument == "BAD_REG") argument = outputFolder + "/bad.reg";

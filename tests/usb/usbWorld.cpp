@@ -25,7 +25,8 @@ std::string UsbRun::outcomeOf(const std::string& busPath) const
 {
     std::string outcome;
     for (const auto& event : eventsOf("update")) {
-        if (event["device"]["busPath"] == busPath) outcome += (outcome.empty() ? "" : ",") + event["outcome"].get<std::string>();
+        if (event["device"]["busPath"] == busPath)
+            outcome += (outcome.empty() ? "" : ",") + event["outcome"].get<std::string>();
     }
     return outcome;
 }
@@ -47,7 +48,7 @@ void UsbWorld::TearDown()
 }
 
 std::shared_ptr<sim::PhysicalDevice> UsbWorld::plugIn(const sim::EmulatedDeviceOptions& options,
-                                                     const std::string& serial)
+                                                      const std::string& serial)
 {
     auto device = sim::makeEmulatedDevice(options);
     bus->plugIn(device, serial);
@@ -94,7 +95,8 @@ std::vector<sim::RequestRecord> UsbWorld::labTrace(const sim::EmulatedDeviceOpti
     return device->trace;
 }
 
-std::string traceDifference(const std::vector<sim::RequestRecord>& expected, const std::vector<sim::RequestRecord>& seen)
+std::string traceDifference(const std::vector<sim::RequestRecord>& expected,
+                            const std::vector<sim::RequestRecord>& seen)
 {
     for (size_t i = 0; i < std::max(expected.size(), seen.size()); ++i) {
         if (i >= expected.size()) return "an extra request: " + sim::describeRequest(seen[i]);

@@ -18,7 +18,7 @@ namespace usb_testing {
 
 struct UsbRun {
     int exitCode = -1;
-    std::string errors;                   // standard error
+    std::string errors;                  // standard error
     std::vector<nlohmann::json> events;  // the JSON lines of standard output
 
     std::vector<nlohmann::json> eventsOf(const std::string& kind) const;
@@ -27,7 +27,7 @@ struct UsbRun {
 };
 
 class UsbWorld : public testing_support::LoaderWorld {
-protected:
+  protected:
     void SetUp() override;
     void TearDown() override;
 

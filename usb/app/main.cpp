@@ -22,8 +22,9 @@ constexpr const char* kExitCodes =
 
 void addOptions(CLI::App& command, usbapp::ProgramOptions& options)
 {
-    command.add_option("--registry", options.registryFiles,
-                       "a registry-editor export (.reg) the loader reads its settings from (repeatable)")
+    command
+        .add_option("--registry", options.registryFiles,
+                    "a registry-editor export (.reg) the loader reads its settings from (repeatable)")
         ->check(CLI::ExistingFile);
     command
         .add_option_function<std::vector<std::string>>(
@@ -31,13 +32,16 @@ void addOptions(CLI::App& command, usbapp::ProgramOptions& options)
             [&options](const std::vector<std::string>& drives) {
                 for (const std::string& drive : drives) {
                     if (drive.size() < 3 || drive[1] != '=' || !std::isalpha(static_cast<unsigned char>(drive[0])))
-                        throw CLI::ValidationError("--drive", "\"" + drive + "\" is not LETTER=FOLDER, such as C=/srv/windows");
-                    options.drives[static_cast<char>(std::toupper(static_cast<unsigned char>(drive[0])))] = drive.substr(2);
+                        throw CLI::ValidationError("--drive",
+                                                   "\"" + drive + "\" is not LETTER=FOLDER, such as C=/srv/windows");
+                    options.drives[static_cast<char>(std::toupper(static_cast<unsigned char>(drive[0])))] =
+                        drive.substr(2);
                 }
             },
             "a folder that stands for a Windows drive: LETTER=FOLDER, such as C=/srv/windows (repeatable)")
         ->expected(1, -1);
-    command.add_option("--device", options.busPaths, "update only the device at this bus path, such as 1-3.2 (repeatable)")
+    command
+        .add_option("--device", options.busPaths, "update only the device at this bus path, such as 1-3.2 (repeatable)")
         ->check([](const std::string& path) {
             static const std::regex form("[0-9]+-[0-9]+(\\.[0-9]+)*");
             return std::regex_match(path, form) ? std::string() : "\"" + path + "\" is not a bus path such as 1-3.2";
@@ -47,7 +51,8 @@ void addOptions(CLI::App& command, usbapp::ProgramOptions& options)
     command.add_flag("--no-progress", options.noProgress, "no progress line, even on a terminal");
     command.add_option("--timeout-ms", options.timeoutMs, "time-out of each control transfer (default 5000)")
         ->check(CLI::Range(1u, 600000u));
-    command.add_option("--module", options.modulePath, "the module to load (default: the one built beside this program)");
+    command.add_option("--module", options.modulePath,
+                       "the module to load (default: the one built beside this program)");
 }
 
 }  // namespace
@@ -59,8 +64,9 @@ int main(int argc, char** argv)
     app.footer(kExitCodes);
     app.require_subcommand(1);
     CLI::App* once = app.add_subcommand("once", "update every selected loader-mode device present now, then exit");
-    CLI::App* watch = app.add_subcommand("watch", "update every selected loader-mode device that is present or arrives, "
-                                                  "until SIGINT or SIGTERM");
+    CLI::App* watch =
+        app.add_subcommand("watch", "update every selected loader-mode device that is present or arrives, "
+                                    "until SIGINT or SIGTERM");
     addOptions(*once, options);
     addOptions(*watch, options);
     once->add_option("--settle-ms", options.settleMs,

@@ -10,11 +10,11 @@ namespace usbapp {
 enum class Mode { once, watch };
 
 // Exit codes; the same list is in the help text and in docs/usb.md.
-constexpr int kExitSuccess = 0;        // once: every selected loader-mode device updated; watch: stopped cleanly
-constexpr int kExitUpdateFailed = 1;   // an update failed or was abandoned, or a device came back in loader mode
-constexpr int kExitInvalid = 2;        // the command line, a .reg file or a drive folder is invalid
-constexpr int kExitCannotRun = 3;      // USB, the module or the host failed; or something was left behind
-constexpr int kExitNothingFound = 4;   // once: no loader-mode device of the selection is present
+constexpr int kExitSuccess = 0;       // once: every selected loader-mode device updated; watch: stopped cleanly
+constexpr int kExitUpdateFailed = 1;  // an update failed or was abandoned, or a device came back in loader mode
+constexpr int kExitInvalid = 2;       // the command line, a .reg file or a drive folder is invalid
+constexpr int kExitCannotRun = 3;     // USB, the module or the host failed; or something was left behind
+constexpr int kExitNothingFound = 4;  // once: no loader-mode device of the selection is present
 
 struct ProgramOptions {
     Mode mode = Mode::once;

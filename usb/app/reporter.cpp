@@ -37,15 +37,24 @@ nlohmann::json deviceJson(const usbhost::DeviceInfo& device)
 const char* kindName(Kind kind)
 {
     switch (kind) {
-    case Kind::arrived: return "arrived";
-    case Kind::left: return "left";
-    case Kind::skipped: return "skipped";
-    case Kind::progress: return "progress";
-    case Kind::update: return "update";
-    case Kind::log: return "log";
-    case Kind::debug: return "debug";
-    case Kind::problem: return "problem";
-    case Kind::misuse: return "misuse";
+    case Kind::arrived:
+        return "arrived";
+    case Kind::left:
+        return "left";
+    case Kind::skipped:
+        return "skipped";
+    case Kind::progress:
+        return "progress";
+    case Kind::update:
+        return "update";
+    case Kind::log:
+        return "log";
+    case Kind::debug:
+        return "debug";
+    case Kind::problem:
+        return "problem";
+    case Kind::misuse:
+        return "misuse";
     }
     return "?";
 }
@@ -72,16 +81,26 @@ std::string updateText(const usbhost::UpdateRecord& update)
 std::string statusText(int32_t status)
 {
     switch (status) {
-    case usbhost::kStalled: return fmt::format("{} (the device refused a request)", status);
-    case usbhost::kDeviceGone: return fmt::format("{} (the device left the bus)", status);
-    case usbhost::kTimedOut: return fmt::format("{} (the device did not answer in time)", status);
-    case usbhost::kTransferFailed: return fmt::format("{} (USB transfer error)", status);
-    case usbhost::kShortTransfer: return fmt::format("{} (the device sent fewer bytes than asked)", status);
-    case usbhost::kAccessDenied: return fmt::format("{} (no access to the device node)", status);
-    case usbhost::kOutOfMemory: return fmt::format("{} (out of memory)", status);
-    case usbhost::kBadArgument: return fmt::format("{} (misuse of the host's interfaces)", status);
-    case usbhost::kAbandoned: return fmt::format("{} (abandoned: the program is stopping)", status);
-    default: return std::to_string(status);
+    case usbhost::kStalled:
+        return fmt::format("{} (the device refused a request)", status);
+    case usbhost::kDeviceGone:
+        return fmt::format("{} (the device left the bus)", status);
+    case usbhost::kTimedOut:
+        return fmt::format("{} (the device did not answer in time)", status);
+    case usbhost::kTransferFailed:
+        return fmt::format("{} (USB transfer error)", status);
+    case usbhost::kShortTransfer:
+        return fmt::format("{} (the device sent fewer bytes than asked)", status);
+    case usbhost::kAccessDenied:
+        return fmt::format("{} (no access to the device node)", status);
+    case usbhost::kOutOfMemory:
+        return fmt::format("{} (out of memory)", status);
+    case usbhost::kBadArgument:
+        return fmt::format("{} (misuse of the host's interfaces)", status);
+    case usbhost::kAbandoned:
+        return fmt::format("{} (abandoned: the program is stopping)", status);
+    default:
+        return std::to_string(status);
     }
 }
 
@@ -209,8 +228,12 @@ void Reporter::summary(int exitCode, const std::vector<usbhost::UpdateRecord>& u
     size_t backInLoader = 0;
     for (const auto& comeback : comebacks) backInLoader += comeback.inLoaderMode ? 1 : 0;
     if (json_) {
-        nlohmann::json out = {{"event", "summary"}, {"exitCode", exitCode}, {"updated", updated}, {"failed", failed},
-                              {"backInLoaderMode", backInLoader}, {"leftovers", leftovers}};
+        nlohmann::json out = {{"event", "summary"},
+                              {"exitCode", exitCode},
+                              {"updated", updated},
+                              {"failed", failed},
+                              {"backInLoaderMode", backInLoader},
+                              {"leftovers", leftovers}};
         line(out.dump());
         return;
     }

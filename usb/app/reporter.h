@@ -13,7 +13,7 @@
 namespace usbapp {
 
 class Reporter {
-public:
+  public:
     Reporter(bool json, bool progress);
 
     void event(const usbhost::HostEvent& event);
@@ -22,7 +22,7 @@ public:
     void summary(int exitCode, const std::vector<usbhost::UpdateRecord>& updates,
                  const std::vector<usbhost::Comeback>& comebacks, const std::vector<std::string>& leftovers);
 
-private:
+  private:
     void line(const std::string& text);  // with the mutex held
     void clearProgress();
     void drawProgress();

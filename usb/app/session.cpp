@@ -83,7 +83,8 @@ int onceExitCode(const std::vector<usbhost::UpdateRecord>& updates, const std::v
     bool anyFailure = false;
     for (const auto& update : updates) {
         if (update.outcome != usbhost::Outcome::ignored) anyLoader = true;
-        if (update.outcome == usbhost::Outcome::failed || update.outcome == usbhost::Outcome::abandoned) anyFailure = true;
+        if (update.outcome == usbhost::Outcome::failed || update.outcome == usbhost::Outcome::abandoned)
+            anyFailure = true;
     }
     for (const auto& comeback : comebacks) anyFailure = anyFailure || comeback.inLoaderMode;
     if (anyFailure) return kExitUpdateFailed;
@@ -118,7 +119,8 @@ int runSession(const ProgramOptions& options, Reporter& reporter)
 
     std::unique_ptr<sim::ModuleImage> module;
     try {
-        module = std::make_unique<sim::ModuleImage>(options.modulePath.empty() ? defaultModulePath() : options.modulePath);
+        module =
+            std::make_unique<sim::ModuleImage>(options.modulePath.empty() ? defaultModulePath() : options.modulePath);
     } catch (const std::exception& failure) {
         reporter.error(failure.what());
         usbhost::shutdown();
@@ -176,14 +178,17 @@ int runSession(const ProgramOptions& options, Reporter& reporter)
     std::vector<usbhost::Comeback> comebacks = usbhost::comebacks();
     for (const auto& comeback : comebacks) {
         if (comeback.inLoaderMode) {
-            reporter.note(comeback.busPath + ": came back in loader mode after its restart: the new firmware did not take");
+            reporter.note(comeback.busPath +
+                          ": came back in loader mode after its restart: the new firmware did not take");
         } else if (!comeback.seen && options.mode == Mode::once) {
             reporter.note(comeback.busPath + ": restarted, and not seen back on the bus within the settle time");
         }
     }
     std::vector<std::string> left = usbhost::leftovers();
-    for (const std::string& handle : sim::kernel::openHandleDescriptions()) left.push_back("open kernel handle: " + handle);
-    for (const std::string& misuse : sim::kernel::misuseReports()) reporter.error("misuse of the kernel by the module: " + misuse);
+    for (const std::string& handle : sim::kernel::openHandleDescriptions())
+        left.push_back("open kernel handle: " + handle);
+    for (const std::string& misuse : sim::kernel::misuseReports())
+        reporter.error("misuse of the kernel by the module: " + misuse);
     usbhost::shutdown();
 
     int code = options.mode == Mode::once ? onceExitCode(updates, comebacks) : kExitSuccess;

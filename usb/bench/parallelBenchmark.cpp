@@ -98,7 +98,8 @@ int main(int argc, char** argv)
     size_t imageBytes = argc > 2 ? static_cast<size_t>(std::atol(argv[2])) : 0x3400;
 
     Setup setup;
-    setup.folder = std::filesystem::temp_directory_path() / ("morvanek-usb-bench-" + std::to_string(std::random_device()()));
+    setup.folder =
+        std::filesystem::temp_directory_path() / ("morvanek-usb-bench-" + std::to_string(std::random_device()()));
     setup.driveC = setup.folder / "C";
     std::filesystem::create_directories(setup.driveC / "WINDOWS" / "system32" / "drivers");
     for (int i = 0; i < count; ++i) {

@@ -77,30 +77,33 @@ void joinFinishedDeliveries(bool all)
     for (auto& thread : done) thread.join();
 }
 
+// The whole of one arrival's handling by the module, on the thread made for it.
+void serveArrival(const std::shared_ptr<Device>& device, const std::shared_ptr<std::atomic<bool>>& finished)
+{
+    setCurrentDevice(device.get());
+    device->beginDelivery();
+    tree().deliver(kListenerArrival, device.get());
+    UpdateRecord record = device->endDelivery();
+    HostEvent event;
+    event.kind = HostEvent::Kind::update;
+    event.update = record;
+    emit(std::move(event));
+    setCurrentDevice(nullptr);
+    {
+        std::lock_guard<std::mutex> lock(state().mutex);
+        state().finished.push_back(record);
+        --state().running;
+    }
+    state().deliveriesChanged.notify_all();
+    *finished = true;
+}
+
 void deliverArrival(std::shared_ptr<Device> device)
 {
     auto finished = std::make_shared<std::atomic<bool>>(false);
     std::lock_guard<std::mutex> lock(state().mutex);
     ++state().running;
-    state().deliveries.push_back({std::thread([device, finished] {
-                                      setCurrentDevice(device.get());
-                                      device->beginDelivery();
-                                      tree().deliver(kListenerArrival, device.get());
-                                      UpdateRecord record = device->endDelivery();
-                                      HostEvent event;
-                                      event.kind = HostEvent::Kind::update;
-                                      event.update = record;
-                                      emit(std::move(event));
-                                      setCurrentDevice(nullptr);
-                                      {
-                                          std::lock_guard<std::mutex> inner(state().mutex);
-                                          state().finished.push_back(record);
-                                          --state().running;
-                                      }
-                                      state().deliveriesChanged.notify_all();
-                                      *finished = true;
-                                  }),
-                                  finished});
+    state().deliveries.push_back({std::thread(serveArrival, device, finished), finished});
 }
 
 void skip(const Device& device, const char* why)
@@ -128,7 +131,8 @@ bool arrived(libusb_device* usbDevice, bool atStart)
     info.productId = descriptor.idProduct;
     if (info.vendorId != kFamilyVendorId) return false;
     info.serial = sysfsSerial(info.busPath);
-    if (info.serial.empty() && !host.options.serials.empty()) info.serial = descriptorSerial(usbDevice, descriptor.iSerialNumber);
+    if (info.serial.empty() && !host.options.serials.empty())
+        info.serial = descriptorSerial(usbDevice, descriptor.iSerialNumber);
     if (!selected(host.options, info)) return false;
 
     auto device = std::make_shared<Device>(usbDevice, descriptor, info);
@@ -198,10 +202,11 @@ bool start(const HostOptions& options, std::string& error)
         host.context = nullptr;
         return false;
     }
-    auto events = static_cast<libusb_hotplug_event>(LIBUSB_HOTPLUG_EVENT_DEVICE_ARRIVED | LIBUSB_HOTPLUG_EVENT_DEVICE_LEFT);
-    result = libusb_hotplug_register_callback(host.context, events, static_cast<libusb_hotplug_flag>(0), kFamilyVendorId,
-                                              LIBUSB_HOTPLUG_MATCH_ANY, LIBUSB_HOTPLUG_MATCH_ANY, onHotplug, nullptr,
-                                              &host.hotplug);
+    auto events =
+        static_cast<libusb_hotplug_event>(LIBUSB_HOTPLUG_EVENT_DEVICE_ARRIVED | LIBUSB_HOTPLUG_EVENT_DEVICE_LEFT);
+    result = libusb_hotplug_register_callback(host.context, events, static_cast<libusb_hotplug_flag>(0),
+                                              kFamilyVendorId, LIBUSB_HOTPLUG_MATCH_ANY, LIBUSB_HOTPLUG_MATCH_ANY,
+                                              onHotplug, nullptr, &host.hotplug);
     if (result != 0) {
         error = std::string("cannot watch the bus: ") + libusb_error_name(result);
         libusb_exit(host.context);
@@ -306,8 +311,10 @@ std::vector<std::string> leftovers()
         result.push_back(std::to_string(allocator().liveBlocks()) + " host allocation(s) live (" +
                          std::to_string(allocator().liveBytes()) + " bytes)");
     }
-    if (tree().liveListeners() != 0) result.push_back(std::to_string(tree().liveListeners()) + " listener record(s) still added");
-    if (tree().liveQueries() != 0) result.push_back(std::to_string(tree().liveQueries()) + " device query(ies) not released");
+    if (tree().liveListeners() != 0)
+        result.push_back(std::to_string(tree().liveListeners()) + " listener record(s) still added");
+    if (tree().liveQueries() != 0)
+        result.push_back(std::to_string(tree().liveQueries()) + " device query(ies) not released");
     std::lock_guard<std::mutex> lock(state().mutex);
     size_t streams = 0;
     for (const auto& entry : state().devices) streams += entry.second->openStreams();

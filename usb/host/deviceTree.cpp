@@ -11,8 +11,8 @@ constexpr uint32_t kUsbQueryAttribute = 1;
 constexpr uint32_t kUsbQueryValue = 0x20757362;  // ' usb'
 }  // namespace
 
-class Tree::Query : public DeviceQuery {
-public:
+class Tree::Query final : public DeviceQuery {
+  public:
     explicit Query(uint32_t id) : id_(id) {}
     void setAttribute(uint32_t id, const void* value, tStatus& status) override
     {
@@ -27,7 +27,7 @@ public:
     }
     uint32_t getId() override { return id_; }
 
-private:
+  private:
     uint32_t id_;
     bool selectsUsb_ = false;
 };
@@ -42,9 +42,8 @@ void Tree::addListener(ListenerRecord* record, tStatus& status)
 {
     if (status < 0) return;
     std::unique_lock<std::mutex> lock(mutex_);
-    bool knownQuery = record != nullptr && std::any_of(queries_.begin(), queries_.end(), [&](const auto& q) {
-                          return q->getId() == record->queryId;
-                      });
+    bool knownQuery = record != nullptr && std::any_of(queries_.begin(), queries_.end(),
+                                                       [&](const auto& q) { return q->getId() == record->queryId; });
     if (record == nullptr || (record->eventKind != kListenerArrival && record->eventKind != kListenerRemoval) ||
         record->callback == nullptr || !knownQuery) {
         lock.unlock();
@@ -77,9 +76,9 @@ void Tree::removeListener(ListenerRecord* record, tStatus* status)
         return std::none_of(listeners_.begin(), listeners_.end(),
                             [&](const auto& l) { return l->record == record && l->inFlight != 0; });
     });
-    listeners_.erase(std::remove_if(listeners_.begin(), listeners_.end(),
-                                    [&](const auto& l) { return l->record == record; }),
-                     listeners_.end());
+    listeners_.erase(
+        std::remove_if(listeners_.begin(), listeners_.end(), [&](const auto& l) { return l->record == record; }),
+        listeners_.end());
 }
 
 DeviceQuery* Tree::createQuery()

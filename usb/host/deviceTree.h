@@ -12,14 +12,13 @@
 
 namespace usbhost {
 
-class Tree : public iDeviceTree {
-public:
+class Tree final : public iDeviceTree {
+  public:
     void addListener(ListenerRecord* record, tStatus& status) override;
     void releaseQuery(DeviceQuery** query) override;
     void removeListener(ListenerRecord* record, tStatus* status) override;
     DeviceQuery* createQuery() override;
-    void findDevices(DeviceList* list, uint32_t selector, DeviceQuery* query, uint32_t flags,
-                     tStatus& status) override;
+    void findDevices(DeviceList* list, uint32_t selector, DeviceQuery* query, uint32_t flags, tStatus& status) override;
 
     // Calls every record of that kind with the device, on the calling thread.
     // A record being removed waits until such calls through it have returned.
@@ -28,7 +27,7 @@ public:
     size_t liveListeners() const;
     size_t liveQueries() const;
 
-private:
+  private:
     class Query;
     struct Listener {
         ListenerRecord* record;

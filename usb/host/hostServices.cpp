@@ -49,11 +49,11 @@ void* _memNewUsingCRT(size_t size, tMemAllocationFlags flags, tStatus* status)
 
 void _memDelete(void* pointer)
 {
-    if (!usbhost::allocator().release(pointer)) usbhost::reportMisuse("_memDelete of a block the host did not hand out");
+    if (!usbhost::allocator().release(pointer))
+        usbhost::reportMisuse("_memDelete of a block the host did not hand out");
 }
 
-void _kvlLogEvent(const char* component, const char* location, uint32_t level, const char* tag,
-                  const char* format, ...)
+void _kvlLogEvent(const char* component, const char* location, uint32_t level, const char* tag, const char* format, ...)
 {
     usbhost::HostEvent event;
     event.kind = usbhost::HostEvent::Kind::log;

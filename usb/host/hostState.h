@@ -23,13 +23,13 @@ class Device;
 
 // Counts live blocks so that leftovers show; safe for any thread.
 class Allocator {
-public:
+  public:
     void* allocate(size_t size, tStatus* status);
     bool release(void* pointer);  // false: not a block of ours
     size_t liveBlocks() const;
     size_t liveBytes() const;
 
-private:
+  private:
     mutable std::mutex mutex_;
     std::map<void*, size_t> live_;
 };
@@ -59,8 +59,8 @@ struct HostState {
     std::map<libusb_device*, std::shared_ptr<Device>> devices;
     // Hotplug events seen inside libusb's event handling, delivered after it.
     std::vector<std::pair<bool, libusb_device*>> pendingEvents;  // true: arrival; each holds a reference
-    std::vector<std::string> presentAtStart;                       // bus paths
-    std::map<std::string, Comeback> restarted;                     // by bus path
+    std::vector<std::string> presentAtStart;                     // bus paths
+    std::map<std::string, Comeback> restarted;                   // by bus path
 
     std::vector<Delivery> deliveries;
     size_t running = 0;

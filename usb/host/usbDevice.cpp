@@ -19,11 +19,10 @@ constexpr uint8_t kPageErase = 0xB9;
 constexpr uint8_t kRestart = 0xBA;
 const uint8_t kCompletionMarker[] = {0xAA, 0x55};
 
-const char* kAccessAdvice =
-    "cannot open the device node: permission denied. Install the udev rule "
-    "70-morvanek.rules (it gives the logged-in user access to 5C1D:4A10 and 5C1D:4A20 "
-    "with TAG+=\"uaccess\"), then unplug and replug the device, or run as a user with access "
-    "to /dev/bus/usb";
+const char* kAccessAdvice = "cannot open the device node: permission denied. Install the udev rule "
+                            "70-morvanek.rules (it gives the logged-in user access to 5C1D:4A10 and 5C1D:4A20 "
+                            "with TAG+=\"uaccess\"), then unplug and replug the device, or run as a user with access "
+                            "to /dev/bus/usb";
 
 bool sameLocation(libusb_device* candidate, uint8_t bus, uint8_t address, const std::vector<uint8_t>& ports)
 {
@@ -289,8 +288,7 @@ void Stream::freeBuffer(void* buffer, tStatus& status)
     if (status < 0) return;
     auto it = buffers_.find(static_cast<const uint8_t*>(buffer));
     if (!open || it == buffers_.end()) {
-        reportMisuse(open ? "freeBuffer of a buffer this stream did not hand out"
-                          : "freeBuffer on a closed stream");
+        reportMisuse(open ? "freeBuffer of a buffer this stream did not hand out" : "freeBuffer on a closed stream");
         setFailure(status, kBadArgument);
         return;
     }

@@ -19,8 +19,8 @@ namespace usbhost {
 
 class Device;
 
-class Stream : public ControlStream {
-public:
+class Stream final : public ControlStream {
+  public:
     explicit Stream(Device& device) : device_(device) {}
 
     void* allocateBuffer(uint32_t size, tStatus& status) override;
@@ -30,15 +30,15 @@ public:
     bool open = true;
     size_t buffersHeld() const { return buffers_.size(); }
 
-private:
+  private:
     bool insideLiveBuffer(const void* data, uint32_t length) const;
 
     Device& device_;
     std::map<const uint8_t*, uint32_t> buffers_;  // used by the one thread that owns the stream
 };
 
-class Device : public UsbDevice {
-public:
+class Device final : public UsbDevice {
+  public:
     // Takes a reference on the libusb device of the host's enumeration context.
     Device(libusb_device* device, const libusb_device_descriptor& descriptor, DeviceInfo info);
     ~Device();
@@ -65,7 +65,7 @@ public:
     // For the device's streams: one control transfer, its outcome as a status.
     tStatus controlTransfer(const nQVKORD100::tTransferParameterUSBControl& request);
 
-private:
+  private:
     tStatus openHandle();
     void closeHandle();
     void count(const nQVKORD100::tTransferParameterUSBControl& request, tStatus outcome);

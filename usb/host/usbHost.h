@@ -23,9 +23,9 @@ constexpr tStatus kTransferFailed = -53004;  // any other USB error (I/O, babble
 constexpr tStatus kShortTransfer = -53005;   // an IN data stage came back shorter than asked
 constexpr tStatus kAccessDenied = -53006;    // the device node is not ours to open
 constexpr tStatus kOutOfMemory = -53007;
-constexpr tStatus kBadArgument = -53008;     // misuse of an interface; also reported as such
+constexpr tStatus kBadArgument = -53008;  // misuse of an interface; also reported as such
 constexpr tStatus kUnknownAttribute = -53009;
-constexpr tStatus kAbandoned = -53010;       // the program is stopping and gave up the update
+constexpr tStatus kAbandoned = -53010;  // the program is stopping and gave up the update
 
 // Page erases stall the loader's CPU for a few milliseconds per page; five
 // seconds leaves a wide margin over that and over a busy hub.
@@ -41,7 +41,7 @@ struct DeviceInfo {
     std::string busPath;  // "1-3.2": bus number, then the hub ports down to the device
     uint16_t vendorId = 0;
     uint16_t productId = 0;
-    std::string serial;   // the USB serial-number string; empty when the device has none
+    std::string serial;  // the USB serial-number string; empty when the device has none
 };
 
 // What happened to a device on one delivery to the module.

@@ -65,19 +65,13 @@ struct Node::Urb {
 
 Node::Node(EmulatedBus& bus, std::string path, int deviceAddress, std::shared_ptr<sim::PhysicalDevice> hardware,
            std::string serial)
-    : busPath(std::move(path)),
-      address(deviceAddress),
-      devNode([&] {
+    : busPath(std::move(path)), address(deviceAddress), devNode([&] {
           char name[32];
           std::snprintf(name, sizeof name, "/dev/bus/usb/001/%03d", deviceAddress);
           return std::string(name);
       }()),
-      sysPath("/sys/devices/pci0000:00/usb1/" + busPath),
-      bus_(bus),
-      hardware_(std::move(hardware)),
-      enumeration_(hardware_->current()),
-      serial_(std::move(serial)),
-      handler_(umockdev_ioctl_base_new())
+      sysPath("/sys/devices/pci0000:00/usb1/" + busPath), bus_(bus), hardware_(std::move(hardware)),
+      enumeration_(hardware_->current()), serial_(std::move(serial)), handler_(umockdev_ioctl_base_new())
 {
     auto* enumerated = static_cast<sim::UsbDeviceSim*>(enumeration_);
     vendorId_ = static_cast<uint16_t>(enumerated->getAttribute(1, nullptr));
@@ -124,10 +118,24 @@ void Node::goDead()
 std::vector<uint8_t> Node::deviceDescriptor() const
 {
     uint8_t serialIndex = serial_.empty() ? 0 : kSerialStringIndex;
-    return {18,   1,    0x00, 0x02, 0xFF, 0x00, 0x00, 64,
-            static_cast<uint8_t>(vendorId_), static_cast<uint8_t>(vendorId_ >> 8),
-            static_cast<uint8_t>(productId_), static_cast<uint8_t>(productId_ >> 8),
-            0x00, 0x01, 0, 0, serialIndex, 1};
+    return {18,
+            1,
+            0x00,
+            0x02,
+            0xFF,
+            0x00,
+            0x00,
+            64,
+            static_cast<uint8_t>(vendorId_),
+            static_cast<uint8_t>(vendorId_ >> 8),
+            static_cast<uint8_t>(productId_),
+            static_cast<uint8_t>(productId_ >> 8),
+            0x00,
+            0x01,
+            0,
+            0,
+            serialIndex,
+            1};
 }
 
 std::vector<uint8_t> Node::configurationDescriptor() const
@@ -251,9 +259,10 @@ void Node::answerReaps()
 {
     for (auto reaper = waitingReaps_.begin(); reaper != waitingReaps_.end();) {
         UMockdevIoctlClient* client = reaper->client;
-        auto done = std::find_if(flying_.begin(), flying_.end(),
-                                 [&](const auto& u) { return u->client == client && u->done; });
-        bool nothingLeft = std::none_of(flying_.begin(), flying_.end(), [&](const auto& u) { return u->client == client; });
+        auto done =
+            std::find_if(flying_.begin(), flying_.end(), [&](const auto& u) { return u->client == client && u->done; });
+        bool nothingLeft =
+            std::none_of(flying_.begin(), flying_.end(), [&](const auto& u) { return u->client == client; });
         if (done == flying_.end() && !nothingLeft) {
             ++reaper;
             continue;

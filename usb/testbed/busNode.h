@@ -22,7 +22,7 @@ namespace usbtestbed {
 class EmulatedBus;
 
 class Node {
-public:
+  public:
     Node(EmulatedBus& bus, std::string busPath, int address, std::shared_ptr<sim::PhysicalDevice> hardware,
          std::string serial);
     ~Node();
@@ -44,7 +44,7 @@ public:
     void goDead();
     void stop();
 
-private:
+  private:
     struct Urb;
     static int onIoctl(UMockdevIoctlBase* handler, UMockdevIoctlClient* client, void* self);
     static void onVanished(UMockdevIoctlBase* handler, UMockdevIoctlClient* client, void* self);

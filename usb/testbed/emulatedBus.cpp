@@ -137,8 +137,9 @@ void EmulatedBus::reenumerate(const std::string& busPath)
             {
                 std::lock_guard<std::mutex> deviceLock(deviceMutex);
                 auto* loader = dynamic_cast<sim::LoaderModeDevice*>(hardware->current());
-                announced = hardware->current() != nullptr &&
-                            (loader == nullptr || hardware->loaderComebacks() <= hardware->options().maxLoaderComebacks);
+                announced =
+                    hardware->current() != nullptr &&
+                    (loader == nullptr || hardware->loaderComebacks() <= hardware->options().maxLoaderComebacks);
             }
             std::string serial;
             {

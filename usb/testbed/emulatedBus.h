@@ -25,7 +25,7 @@ namespace usbtestbed {
 class Node;
 
 class EmulatedBus {
-public:
+  public:
     // Real time per virtual time of the devices' timing models: 1 makes each
     // request take as long as the model says; 0 (the default) waits for nothing.
     explicit EmulatedBus(double timeScale = 0);
@@ -58,7 +58,7 @@ public:
     std::mutex deviceMutex;
     const double timeScale;
 
-private:
+  private:
     struct Action {
         std::chrono::steady_clock::time_point due;
         std::function<void()> work;

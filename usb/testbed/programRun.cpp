@@ -34,7 +34,8 @@ void runUnderUmockdev()
     std::vector<char*> argv;
     for (std::string& word : words) argv.push_back(word.data());
     argv.push_back(nullptr);
-    std::string preloads = std::string("libumockdev-preload.so.0") + (preload != nullptr ? std::string(":") + preload : "");
+    std::string preloads =
+        std::string("libumockdev-preload.so.0") + (preload != nullptr ? std::string(":") + preload : "");
     setenv("LD_PRELOAD", preloads.c_str(), 1);
     // The preload comes before the sanitizer's runtime, which must accept that.
     setenv("ASAN_OPTIONS", "verify_asan_link_order=0", 1);

@@ -21,7 +21,7 @@ struct ProgramOutput {
 };
 
 class ProgramRun {
-public:
+  public:
     // Starts the command (program first) with UMOCKDEV_DIR set to the bus
     // folder; standard output and error go to files in the output folder.
     ProgramRun(const std::vector<std::string>& command, const std::string& busFolder, const std::string& outputFolder);
@@ -29,7 +29,7 @@ public:
     // Sends the signal (0: none) and waits for the program to end.
     ProgramOutput finish(int signal = 0);
 
-private:
+  private:
     pid_t child_;
     std::string outFile_;
     std::string errFile_;
