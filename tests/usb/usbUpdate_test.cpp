@@ -194,6 +194,27 @@ TEST_F(UsbWorld, FailsAReadThatEndsEarly)
     EXPECT_FALSE(device->completionMarkerInPlace());
 }
 
+// In watch mode such a device is updated again after each comeback, but not
+// forever: the third comeback in a row is left alone.
+TEST_F(UsbWorld, WatchStopsUpdatingADeviceThatKeepsComingBackInLoaderMode)
+{
+    std::vector<uint8_t> image = makeImage(1000);
+    image[6] = 0x12;
+    writeDefaultImage(0x4B01, image);
+    auto device = plugIn(deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber));
+    auto program = startUsb({"watch"});
+    bool thirdComeback = bus->waitForHistory(7, 20000);  // the add, then three removals and comebacks
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+
+    UsbRun run = finishUsb(*program, SIGTERM);
+
+    EXPECT_TRUE(thirdComeback);
+    EXPECT_EQ(run.exitCode, 0) << run.errors;
+    EXPECT_EQ(run.outcomeOf("1-1"), "updated,updated,updated");
+    ASSERT_EQ(run.eventsOf("skipped").size(), 1u);
+    EXPECT_NE(run.eventsOf("skipped")[0]["text"].get<std::string>().find("not updated again"), std::string::npos);
+}
+
 struct SelectionCase {
     const char* name;
     std::vector<std::string> arguments;

@@ -11,6 +11,10 @@ namespace usbhost {
 
 namespace {
 
+// A device whose new firmware does not take comes back in loader mode after
+// every restart; it is updated again this many times in a row, not forever.
+constexpr int kLoaderComebacksUpdated = 2;
+
 std::string busPathOf(libusb_device* device)
 {
     uint8_t ports[8];
@@ -137,6 +141,7 @@ bool arrived(libusb_device* usbDevice, bool atStart)
 
     auto device = std::make_shared<Device>(usbDevice, descriptor, info);
     bool comeback = false;
+    int loaderComebacks = 0;
     {
         std::lock_guard<std::mutex> lock(host.mutex);
         host.devices[usbDevice] = device;
@@ -147,6 +152,11 @@ bool arrived(libusb_device* usbDevice, bool atStart)
             it->second.inLoaderMode = device->isLoader();
             it->second.productId = info.productId;
             comeback = true;
+            if (device->isLoader()) {
+                loaderComebacks = ++host.loaderComebacksInARow[info.busPath];
+            } else {
+                host.loaderComebacksInARow.erase(info.busPath);
+            }
         }
     }
     HostEvent event;
@@ -156,6 +166,9 @@ bool arrived(libusb_device* usbDevice, bool atStart)
 
     if (!host.deliverArrivals) {
         skip(*device, "arrived while the program is stopping; not handed to the loader");
+    } else if (loaderComebacks > kLoaderComebacksUpdated) {
+        skip(*device, "came back in loader mode after each of its last restarts; not updated again until it is "
+                      "plugged in anew");
     } else if (!atStart && device->isLoader() && !host.deliverNewLoaderArrivals) {
         skip(*device, comeback ? "came back in loader mode; not updated again in once mode"
                                : "arrived after the start; once mode updates only devices present at the start");
@@ -177,6 +190,10 @@ void left(libusb_device* usbDevice)
         state().devices.erase(it);
     }
     device->markGone();
+    if (!device->restarted()) {
+        std::lock_guard<std::mutex> lock(state().mutex);
+        state().loaderComebacksInARow.erase(device->info().busPath);  // unplugged: a fresh start when it is back
+    }
     HostEvent event;
     event.kind = HostEvent::Kind::left;
     event.text = device->restarted() ? "left the bus to restart" : "left the bus";

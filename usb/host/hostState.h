@@ -61,6 +61,7 @@ struct HostState {
     std::vector<std::pair<bool, libusb_device*>> pendingEvents;  // true: arrival; each holds a reference
     std::vector<std::string> presentAtStart;                     // bus paths
     std::map<std::string, Comeback> restarted;                   // by bus path
+    std::map<std::string, int> loaderComebacksInARow;            // by bus path
 
     std::vector<Delivery> deliveries;
     size_t running = 0;
