@@ -203,12 +203,12 @@ TEST_F(UsbWorld, WatchStopsUpdatingADeviceThatKeepsComingBackInLoaderMode)
     writeDefaultImage(0x4B01, image);
     auto device = plugIn(deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber));
     auto program = startUsb({"watch"});
-    bool thirdComeback = bus->waitForHistory(7, 20000);  // the add, then three removals and comebacks
-    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    bool thirdComebackLeftAlone = program->waitForOutput("\"event\":\"skipped\"", 20000);
 
     UsbRun run = finishUsb(*program, SIGTERM);
 
-    EXPECT_TRUE(thirdComeback);
+    EXPECT_TRUE(thirdComebackLeftAlone);
+    EXPECT_EQ(bus->history().size(), 7u);  // the add, then three removals and comebacks
     EXPECT_EQ(run.exitCode, 0) << run.errors;
     EXPECT_EQ(run.outcomeOf("1-1"), "updated,updated,updated");
     ASSERT_EQ(run.eventsOf("skipped").size(), 1u);
@@ -251,15 +251,13 @@ TEST_F(UsbWorld, WatchUpdatesADeviceThatArrivesAndStopsOnSigterm)
 {
     writeDefaultImage(0x4B01, makeImage(1500));
     auto program = startUsb({"watch"});
-    // Give the program time to load the module and listen; an arrival before
-    // that is found at start instead, which is no less valid.
-    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    bool listening = program->waitForOutput("watching for loader-mode devices", 20000);
     auto device = plugIn(deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber));
-    bool cameBack = bus->waitForHistory(3, 20000);
-    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    bool cameBack = program->waitForOutput("\"outcome\":\"ignored\"", 20000);  // the product, back
 
     UsbRun run = finishUsb(*program, SIGTERM);
 
+    EXPECT_TRUE(listening);
     EXPECT_TRUE(cameBack);
     EXPECT_EQ(run.exitCode, 0) << run.errors;
     EXPECT_TRUE(device->completionMarkerInPlace());
@@ -290,7 +288,8 @@ TEST_P(StopWhileUpdating, FinishesOrAbandonsTheRunningUpdate)
     options.timing = sim::TimingModel::fullSpeed();
     auto device = plugIn(options);
     auto program = startUsb({"once"});
-    std::this_thread::sleep_for(std::chrono::milliseconds(400));
+    ASSERT_TRUE(program->waitForOutput("present at start", 20000));
+    std::this_thread::sleep_for(std::chrono::milliseconds(200));  // into the update
     for (int i = 1; i < GetParam().signals; ++i) {
         program->signal(SIGINT);
         std::this_thread::sleep_for(std::chrono::milliseconds(50));

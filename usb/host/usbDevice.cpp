@@ -213,6 +213,10 @@ UpdateRecord Device::endDelivery()
 
 tStatus Device::controlTransfer(const nQVKORD100::tTransferParameterUSBControl& request)
 {
+    // A device told to restart can leave the bus and come back before this
+    // thread sees the transfer end, so the restart is noted before it is sent.
+    bool restart = request.bmRequestType == kVendorOut && request.bRequest == kRestart;
+    if (restart) expectRestart(true);
     tStatus outcome = 0;
     if (state().abandoning) {
         outcome = kAbandoned;
@@ -233,8 +237,20 @@ tStatus Device::controlTransfer(const nQVKORD100::tTransferParameterUSBControl& 
             outcome = kShortTransfer;
         }
     }
+    if (restart && outcome < 0) expectRestart(false);
     count(request, outcome);
     return outcome;
+}
+
+void Device::expectRestart(bool expected)
+{
+    restarted_ = expected;
+    std::lock_guard<std::mutex> lock(state().mutex);
+    if (expected) {
+        state().restarted[info_.busPath] = Comeback{info_.busPath};
+    } else {
+        state().restarted.erase(info_.busPath);
+    }
 }
 
 void Device::count(const nQVKORD100::tTransferParameterUSBControl& request, tStatus outcome)
@@ -256,11 +272,6 @@ void Device::count(const nQVKORD100::tTransferParameterUSBControl& request, tSta
             ++record_.blocksWritten;
             progress = true;
         }
-    } else if (request.bRequest == kRestart) {
-        // Noted before the device can leave and come back, so its comeback is recognised.
-        restarted_ = true;
-        std::lock_guard<std::mutex> lock(state().mutex);
-        state().restarted[info_.busPath] = Comeback{info_.busPath};
     }
     if (progress) {
         HostEvent event;

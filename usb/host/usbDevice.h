@@ -69,6 +69,7 @@ class Device final : public UsbDevice {
     tStatus openHandle();
     void closeHandle();
     void count(const nQVKORD100::tTransferParameterUSBControl& request, tStatus outcome);
+    void expectRestart(bool expected);
 
     libusb_device* device_;
     libusb_device_descriptor descriptor_;

@@ -5,10 +5,12 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
 #include <sstream>
+#include <thread>
 
 namespace usbtestbed {
 
@@ -59,6 +61,16 @@ ProgramRun::ProgramRun(const std::vector<std::string>& command, const std::strin
         argv.push_back(nullptr);
         execv(argv[0], argv.data());
         _exit(127);
+    }
+}
+
+bool ProgramRun::waitForOutput(const std::string& text, int timeoutMs) const
+{
+    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    for (;;) {
+        if (readFile(outFile_).find(text) != std::string::npos) return true;
+        if (std::chrono::steady_clock::now() >= deadline) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }
 }
 

@@ -26,6 +26,8 @@ class ProgramRun {
     // folder; standard output and error go to files in the output folder.
     ProgramRun(const std::vector<std::string>& command, const std::string& busFolder, const std::string& outputFolder);
     void signal(int number);
+    // Waits until the program's standard output holds the text; false on time-out.
+    bool waitForOutput(const std::string& text, int timeoutMs) const;
     // Sends the signal (0: none) and waits for the program to end.
     ProgramOutput finish(int signal = 0);
 
