@@ -36,8 +36,8 @@ std::string UsbRun::outcomeOf(const std::string& busPath) const
 void UsbWorld::SetUp()
 {
     LoaderWorld::SetUp();
-    if (!umockdev_in_mock_environment()) GTEST_SKIP() << "umockdev's preload is not active here, so no bus can be emulated";
     bus = std::make_unique<usbtestbed::EmulatedBus>();
+    if (!umockdev_in_mock_environment()) GTEST_SKIP() << "umockdev's preload is not active here, so no bus can be emulated";
     outputFolder = (driveC.parent_path() / (driveC.filename().string() + "-usb")).string();
     std::filesystem::create_directories(outputFolder);
 }
