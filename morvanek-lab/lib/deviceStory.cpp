@@ -92,10 +92,15 @@ std::string pageRanges(const std::vector<uint16_t>& pages)
     return fmt::format("{}", fmt::join(parts, ", "));
 }
 
+// Reports of large runs format whole traces: one pass, no formatting call per byte.
 std::string hexBytesText(const std::vector<uint8_t>& bytes)
 {
-    std::string text;
-    for (size_t i = 0; i < bytes.size(); ++i) text += fmt::format(i == 0 ? "{:02X}" : " {:02X}", bytes[i]);
+    static constexpr char kDigits[] = "0123456789ABCDEF";
+    std::string text(bytes.empty() ? 0 : bytes.size() * 3 - 1, ' ');
+    for (size_t i = 0; i < bytes.size(); ++i) {
+        text[i * 3] = kDigits[bytes[i] >> 4];
+        text[i * 3 + 1] = kDigits[bytes[i] & 0xF];
+    }
     return text;
 }
 
