@@ -110,6 +110,8 @@ TEST(LabSummary, CountsEachVerdictAndGivesEachScenarioItsBusTime)
     EXPECT_NE(text.find("  PASS      two.json  bus time " + bus + " (2 device(s), "), std::string::npos) << text;
     EXPECT_NE(text.find("  FAIL      two.json  bus time "), std::string::npos) << text;
     EXPECT_NE(text.find("  INVALID   bad.json\n"), std::string::npos) << text;
+    EXPECT_EQ(lab::jsonReport(results, {})["scenarios"][0]["busMicroseconds"],
+              lab::layOutBusTimeline(results[0].record).total.count());
 }
 
 TEST(LabSvg, TextIsEscapedSoThatAnyNameGivesWellFormedXml)
