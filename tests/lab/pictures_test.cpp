@@ -87,6 +87,29 @@ TEST(LabBusTimeline, ServesDevicesOneAfterAnotherOnTheirOwnBusModels)
     EXPECT_EQ(std::string(lab::busModelName(record.devices[1])), "full-speed bus, assumed");
 }
 
+// A second update starts over with the identity check, and the failed
+// request of the first shows in its lane.
+TEST(LabBusTimeline, EachUpdateStartsOverWithTheIdentityCheck)
+{
+    lab::ScenarioResult result =
+        lab::runScenarioFile(MORVANEK_LAB_SCENARIOS "/unplug-during-programming.json", lab::RunOptions{});
+    ASSERT_EQ(result.exitCode(), lab::kExitSuccess) << result.invalid << result.labError;
+    const lab::DeviceRecord& device = result.record.devices.at(0);
+    EXPECT_EQ(phasesText(device), "identity erase program verify program verify "
+                                  "identity erase program verify program verify program verify program verify marker restart");
+    lab::BusTimeline timeline = lab::layOutBusTimeline(result.record);
+    ASSERT_EQ(timeline.requests.size(), 20u + 45u);  // 3 identity reads, 4 erases, 4 blocks of 9, marker, restart
+    EXPECT_TRUE(timeline.requests[19].failed);
+    EXPECT_EQ(timeline.requests[19].phase, lab::BusPhase::verify);
+    EXPECT_EQ(timeline.requests[20].update, 1);
+    EXPECT_EQ(timeline.total, device.elapsed);
+
+    std::string svg = lab::timelineSvg(result.record, timeline, {0}, "wobbly");
+    EXPECT_NE(svg.find(">update 2</text>"), std::string::npos);
+    EXPECT_NE(svg.find("wobbly verify: read 0x0480 64 failed;"), std::string::npos);
+    EXPECT_NE(svg.find("update 1 (0.0 ms to "), std::string::npos);
+}
+
 TEST(LabSummary, CountsEachVerdictAndGivesEachScenarioItsBusTime)
 {
     std::vector<lab::ScenarioResult> results;
@@ -149,6 +172,18 @@ TEST(LabSvg, FlashMapMarksWhatDidNotTakeWhereItHappened)
     EXPECT_NE(timeline.find("update 1 (0.0 ms to "), std::string::npos);
     EXPECT_NE(timeline.find("failed: Flash write failed verification on page 2."), std::string::npos);
     EXPECT_NE(timeline.find("but the identity repair did not take"), std::string::npos);
+}
+
+// A folder that cannot be made is the lab's failure, not the scenario's.
+TEST(LabSvg, PicturesThatCannotBeWrittenAreALabError)
+{
+    lab::ScenarioResult result = runTwo(false, false);
+    std::filesystem::path file = std::filesystem::path(::testing::TempDir()) / "morvanek-lab-not-a-folder";
+    std::ofstream(file) << "a file where the pictures' folder should go";
+    EXPECT_EQ(lab::writePicturesOf(result, file), "");
+    EXPECT_EQ(result.exitCode(), lab::kExitLabError);
+    EXPECT_NE(result.labError.find("cannot make the folder"), std::string::npos) << result.labError;
+    std::filesystem::remove(file);
 }
 
 int run(const std::string& command)
