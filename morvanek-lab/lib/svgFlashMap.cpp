@@ -195,10 +195,16 @@ public:
             double x = kGridLeft + static_cast<double>(column) * (kCellWidth + kCellGap);
             double y = top + static_cast<double>(row) * (kCellHeight + kCellGap);
             if (column == 0) canvas_.text(kGridLeft - 6, y + 19, fmt::format("0x{:04X}", page * kPageSize), {10, "end", "#555555"});
-            double strip = kCellWidth / static_cast<double>(kPageSize / kStripBytes);
-            for (size_t s = 0; s < kPageSize / kStripBytes; ++s) {
+            // Strips of one state make one rectangle: most pages are all of one kind.
+            constexpr size_t strips = kPageSize / kStripBytes;
+            double strip = kCellWidth / static_cast<double>(strips);
+            for (size_t s = 0; s < strips;) {
                 ByteState state = strongest(map_, page * kPageSize + s * kStripBytes, kStripBytes);
-                canvas_.rect(x + static_cast<double>(s) * strip, y, strip + 0.05, kCellHeight, stateColour(state));
+                size_t end = s + 1;
+                while (end < strips && strongest(map_, page * kPageSize + end * kStripBytes, kStripBytes) == state) ++end;
+                canvas_.rect(x + static_cast<double>(s) * strip, y, static_cast<double>(end - s) * strip + 0.05,
+                             kCellHeight, stateColour(state));
+                s = end;
             }
             const char* border = "#bbbbbb";
             double borderWidth = 0.8;

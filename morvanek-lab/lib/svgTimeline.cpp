@@ -260,6 +260,10 @@ std::string timelineSvg(const RunRecord& record, const BusTimeline& timeline, co
     drawing.axis(88);
     double y = 98;
     for (int device : devices) y = drawing.band(device, y);
+    if (devices.empty()) {
+        canvas.text(10, y + 12, "no device in this scenario", {12, "start", "#555555"});
+        y += 24;
+    }
     return canvas.document(y, title);
 }
 
