@@ -7,8 +7,9 @@ set -euo pipefail
 build=${1:?usage: checkTestNames.sh BUILD_DIR}
 status=0
 
-# Suite/Fixture.Test/CaseName: letters and digits, parts joined by '_'.
-gtestName='^([A-Za-z][A-Za-z0-9]*/)?[A-Za-z][A-Za-z0-9]*\.[A-Za-z][A-Za-z0-9_]*(/[A-Za-z0-9]+(_[A-Za-z0-9]+)*)?$'
+# Prefix/Fixture.Test/CaseName, each in UpperCamelCase (letters and digits);
+# a case made of several parameters joins their names with '_'.
+gtestName='^([A-Z][A-Za-z0-9]*/)?[A-Z][A-Za-z0-9]*\.[A-Z][A-Za-z0-9]*(/[A-Za-z0-9]+(_[A-Za-z0-9]+)*)?$'
 # What a printed parameter leaves behind: byte dumps, addresses, spaces.
 unreadable='byte object|GetParam|TypeParam|0x[0-9a-fA-F]{8,}|[0-9a-fA-F]{12,}|[<> #]'
 
