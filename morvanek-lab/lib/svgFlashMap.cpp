@@ -257,7 +257,7 @@ public:
             double x = left + static_cast<double>(i) * cell;
             std::string tooltip = fmt::format("0x{:04X}: {:02X} before, {:02X} after ({})", address, before, after, stateName(state));
             if (state == ByteState::wrong) tooltip += fmt::format("; {:02X} was written", map_.written[address]);
-            canvas_.rect(x + 1, y, cell - 2, 34, stateColour(state == ByteState::untouched ? ByteState::untouched : state),
+            canvas_.rect(x + 1, y, cell - 2, 34, stateColour(state),
                          tooltip, "#999999", 0.5);
             canvas_.text(x + cell / 2, y + 14, fmt::format("{:02X}", before), {10.5, "middle", "#666666"});
             canvas_.text(x + cell / 2, y + 28, fmt::format("{:02X}", after),
