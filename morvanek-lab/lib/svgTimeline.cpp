@@ -19,6 +19,9 @@ constexpr double kPlotRight = kWidth - 30;
 constexpr double kLaneHeight = 13;
 constexpr double kLaneStep = 17;
 constexpr const char* kFailedColour = "#d62728";
+// With more devices than this, each gets one row with its phases in colour
+// rather than a lane per phase, so that a long queue stays one screen tall.
+constexpr size_t kMostDevicesInFull = 6;
 
 // The lanes drawn, top to bottom, in the order an update goes through them.
 constexpr std::array<BusPhase, 6> kLanes = {BusPhase::identity, BusPhase::erase,  BusPhase::program,
@@ -170,6 +173,29 @@ public:
         return y + 8;
     }
 
+    // One device in one row: its phases in colour, and a square at the end that
+    // says how it ended, with every update's outcome in its hover text.
+    double row(int index, double top)
+    {
+        const DeviceRecord& device = record_.devices[static_cast<size_t>(index)];
+        std::vector<std::string> outcomes;
+        bool ended = true;
+        for (const UpdateStory& story : tellDeviceStory(record_, index)) {
+            outcomes.push_back(fmt::format("update {}: {}", story.index + 1, outcomeText(story)));
+            ended = story.restarted && story.markerTook;
+        }
+        std::string name = device.name.size() > 22 ? device.name.substr(0, 21) + "..." : device.name;
+        canvas_.text(kPlotLeft - 8, top + 10, name, {10.5, "end", "#333333"});
+        canvas_.rect(kPlotLeft, top, kPlotRight - kPlotLeft, kLaneHeight, "#f5f5f5");
+        grid(top, top + kLaneHeight);
+        compact_ = true;
+        requests(index, device, top, top + kLaneHeight);
+        compact_ = false;
+        std::string summary = fmt::format("{}: {}", device.name, outcomes.empty() ? "no request" : fmt::format("{}", fmt::join(outcomes, "; ")));
+        canvas_.rect(kPlotRight + 6, top + 2, 9, 9, outcomes.empty() ? "#bbbbbb" : ended ? "#33a02c" : kFailedColour, summary);
+        return top + kLaneStep;
+    }
+
     SvgCanvas& canvas() { return canvas_; }
 
 private:
@@ -201,7 +227,7 @@ private:
             if (request.device != index) continue;
             if (request.update != lastUpdate) {
                 // Where an update begins: a dashed line and its number, when there are several.
-                if (device.updates > 1) {
+                if (device.updates > 1 && !compact_) {
                     canvas_.line(x(request.start), lanesTop - 3, x(request.start), lanesBottom, "#777777", 1, true);
                     canvas_.text(x(request.start) + 3, lanesTop - 3, fmt::format("update {}", request.update + 1),
                                  {9.5, "start", "#555555"});
@@ -235,13 +261,14 @@ private:
         std::string tooltip = fmt::format("{} {}: {}; {} from {}", device.name, busPhaseName(first.phase), what,
                                           durationText(last.start + last.duration - first.start),
                                           durationText(first.start));
-        canvas_.rect(left, lanesTop + lane * kLaneStep, std::max(right - left, 1.0), kLaneHeight,
+        canvas_.rect(left, compact_ ? lanesTop : lanesTop + lane * kLaneStep, std::max(right - left, 1.0), kLaneHeight,
                      first.failed ? kFailedColour : phaseColour(first.phase), tooltip);
     }
 
     const RunRecord& record_;
     const BusTimeline& timeline_;
     SvgCanvas canvas_{kWidth};
+    bool compact_ = false;
 };
 
 }  // namespace
@@ -259,7 +286,13 @@ std::string timelineSvg(const RunRecord& record, const BusTimeline& timeline, co
     drawing.legend(60);
     drawing.axis(88);
     double y = 98;
-    for (int device : devices) y = drawing.band(device, y);
+    bool compact = devices.size() > kMostDevicesInFull;
+    if (compact) {
+        canvas.text(10, y + 12, fmt::format("{} devices, one row each; hover over a row's end for how it ended", devices.size()),
+                    {11.5, "start", "#444444"});
+        y += 22;
+    }
+    for (int device : devices) y = compact ? drawing.row(device, y) : drawing.band(device, y);
     if (devices.empty()) {
         canvas.text(10, y + 12, "no device in this scenario", {12, "start", "#555555"});
         y += 24;

@@ -174,6 +174,31 @@ TEST(LabSvg, FlashMapMarksWhatDidNotTakeWhereItHappened)
     EXPECT_NE(timeline.find("but the identity repair did not take"), std::string::npos);
 }
 
+// A long queue keeps to one row per device, each saying how it ended.
+TEST(LabSvg, ManyDevicesShareOneTimelineOneRowEach)
+{
+    std::string devices;
+    for (int i = 0; i < 7; ++i) {
+        devices += std::string(i == 0 ? "" : ", ") + "{\"name\": \"d" + std::to_string(i) +
+                   "\", \"identity\": {\"productId\": \"0x4B01\"}" +
+                   (i == 4 ? ", \"faults\": {\"stallKinds\": [\"restart\"]}" : "") + "}";
+    }
+    std::string text = R"({
+      "registry": { "keys": { "HKLM\\Software\\Microsoft\\Windows NT\\CurrentVersion": { "SystemRoot": "C:\\WINDOWS" } } },
+      "drives": { "C": { "files": { "WINDOWS\\system32\\drivers\\QVUSB4B01.bin": { "generate": { "size": 600 } } } } },
+      "devices": [ )" + devices + " ] }";
+    lab::ScenarioResult result = lab::runScenario(lab::parseScenarioText(text, "seven.json", "."), {});
+    ASSERT_TRUE(result.invalid.empty() && result.labError.empty()) << result.invalid << result.labError;
+    std::vector<int> all{0, 1, 2, 3, 4, 5, 6};
+    std::string svg = lab::timelineSvg(result.record, lab::layOutBusTimeline(result.record), all, "seven");
+    EXPECT_NE(svg.find(">7 devices, one row each;"), std::string::npos);
+    EXPECT_NE(svg.find("<title>d3: update 1: programmed 2 block(s), all verified, marker written, restarted</title>"),
+              std::string::npos);
+    EXPECT_NE(svg.find("<title>d4: update 1: failed: The firmware update failed."), std::string::npos);
+    // The phases' names only in the legend: no lane per phase.
+    EXPECT_EQ(svg.find(">verify</text>"), svg.rfind(">verify</text>"));
+}
+
 // A folder that cannot be made is the lab's failure, not the scenario's.
 TEST(LabSvg, PicturesThatCannotBeWrittenAreALabError)
 {
