@@ -229,7 +229,8 @@ public:
     // The identity block's 16 bytes, before and after, each coloured by what was written to it.
     double identityRow(double top)
     {
-        if (device_.layout == nullptr) return top;
+        const size_t size = sim::FlashMemory::kSize;
+        if (device_.layout == nullptr || device_.flashBefore.size() < size || device_.flashAfter.size() < size) return top;
         const size_t block = device_.layout->identityPage + kIdentityBlock;
         canvas_.text(10, top + 14, fmt::format("identity block at 0x{:04X}, before and after the run", block),
                      {12.5, "start", "#222222", true});
