@@ -11,6 +11,7 @@
 #include "lib/examine.h"
 #include "lib/jsonNode.h"
 #include "lib/lab.h"
+#include "lib/pictures.h"
 #include "lib/reports.h"
 
 namespace {
@@ -25,6 +26,7 @@ struct CommonOptions {
     bool noProgress = false;
     std::string modulePath;
     std::vector<std::string> memory;
+    std::string svgFolder;
 };
 
 void addCommonOptions(CLI::App& command, CommonOptions& options)
@@ -34,6 +36,8 @@ void addCommonOptions(CLI::App& command, CommonOptions& options)
     command.add_option("--memory", options.memory, "show device memory: ADDRESS:LENGTH, such as 0x0200:64 (repeatable)");
     command.add_flag("--no-progress", options.noProgress, "no progress line, even on a terminal");
     command.add_option("--module", options.modulePath, "the module to load (default: the one built beside the lab)");
+    command.add_option("--svg", options.svgFolder,
+                       "write pictures into this folder: per device a flash map and a timeline on the bus model");
 }
 
 // "0x0200:64" -> address and length; throws ScenarioError-free CLI validation errors.
@@ -58,9 +62,11 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     std::vector<lab::ScenarioResult> results;
     for (size_t i = 0; i < files.size(); ++i) {
         results.push_back(lab::runScenarioFile(files[i], options));
+        std::string pictures = common.svgFolder.empty() ? "" : lab::writePicturesOf(results.back(), common.svgFolder);
         if (common.json) continue;
         if (i != 0) std::fputs("\n", stdout);
         lab::printTextReport(stdout, results.back(), options);
+        if (!pictures.empty()) fmt::print("{}\n", pictures);
         std::fflush(stdout);
     }
     if (common.json) {
