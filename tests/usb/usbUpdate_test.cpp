@@ -112,6 +112,29 @@ INSTANTIATE_TEST_SUITE_P(
                       FaultCase{"disconnect", unplugAt(60), {"add 1-1 5C1D:4A10", "remove 1-1"}, "Status = -53002"}),
     [](const auto& info) { return std::string(info.param.name); });
 
+// For people: one line per event on standard error, naming the device, and
+// the loader's event-log lines with their location.
+TEST_F(UsbWorld, TellsPeopleWhatHappenedOnStandardError)
+{
+    writeDefaultImage(0x4B01, makeImage(1000));
+    sim::EmulatedDeviceOptions options = deviceWithIdentity(0x4A10, 0x4B01, kSerialNumber);
+    options.faults = stallAt(10);
+    plugIn(options, "00012345");
+
+    UsbRun run = runUsb({"once"}, false);
+
+    EXPECT_EQ(run.exitCode, 1);
+    EXPECT_TRUE(run.events.empty());
+    for (const char* line :
+         {"morvanek-usb: 1-1 5C1D:4A10: present at start (serial 00012345)\n",
+          "morvanek-usb: 1-1 5C1D:4A10: event log: morvanek source\\DeviceTable:451 - [morvaneLoader] The firmware "
+          "update failed.  Leaving device 5C1D 4B01 00012345 in loader mode  Status = -53001\n",
+          "morvanek-usb: 1-1 5C1D:4A10: update failed after 10 request(s); the device stays in loader mode; first "
+          "failure: -53001 (the device refused a request)\n",
+          "morvanek-usb: 0 device(s) updated, 1 failed; exit code 1\n"})
+        EXPECT_NE(run.errors.find(line), std::string::npos) << line << "\nin:\n" << run.errors;
+}
+
 TEST_F(UsbWorld, UpdatesSeveralDevicesAtOnce)
 {
     const uint16_t products[] = {0x4B01, 0x4B02, 0x4B03};

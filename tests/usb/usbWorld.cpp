@@ -37,7 +37,8 @@ void UsbWorld::SetUp()
 {
     LoaderWorld::SetUp();
     bus = std::make_unique<usbtestbed::EmulatedBus>();
-    if (!umockdev_in_mock_environment()) GTEST_SKIP() << "umockdev's preload is not active here, so no bus can be emulated";
+    if (!umockdev_in_mock_environment())
+        GTEST_SKIP() << "umockdev's preload is not active here, so no bus can be emulated";
     outputFolder = (driveC.parent_path() / (driveC.filename().string() + "-usb")).string();
     std::filesystem::create_directories(outputFolder);
 }
@@ -58,15 +59,16 @@ std::shared_ptr<sim::PhysicalDevice> UsbWorld::plugIn(const sim::EmulatedDeviceO
     return device;
 }
 
-std::unique_ptr<usbtestbed::ProgramRun> UsbWorld::startUsb(const std::vector<std::string>& arguments)
+std::unique_ptr<usbtestbed::ProgramRun> UsbWorld::startUsb(const std::vector<std::string>& arguments, bool json)
 {
     std::string registryFile = outputFolder + "/machine.reg";
     std::ofstream(registryFile) << sim::regfile::exportRegistryText(sim::kernel::registry());
     std::vector<std::string> command = {MORVANEK_USB_EXECUTABLE};
     command.insert(command.end(), arguments.begin(), arguments.end());
-    for (const std::string& extra : {std::string("--json"), std::string("--no-progress"), "--registry=" + registryFile,
-                                     "--drive=C=" + driveC.string()})
+    for (const std::string& extra :
+         {std::string("--no-progress"), "--registry=" + registryFile, "--drive=C=" + driveC.string()})
         command.push_back(extra);
+    if (json) command.push_back("--json");
     return std::make_unique<usbtestbed::ProgramRun>(command, bus->folder(), outputFolder);
 }
 
@@ -78,14 +80,14 @@ UsbRun UsbWorld::finishUsb(usbtestbed::ProgramRun& program, int signal)
     run.errors = output.errors;
     std::istringstream lines(output.out);
     for (std::string line; std::getline(lines, line);) {
-        if (!line.empty()) run.events.push_back(nlohmann::json::parse(line));
+        if (!line.empty()) run.events.push_back(nlohmann::json::parse(line, nullptr, false));
     }
     return run;
 }
 
-UsbRun UsbWorld::runUsb(const std::vector<std::string>& arguments)
+UsbRun UsbWorld::runUsb(const std::vector<std::string>& arguments, bool json)
 {
-    return finishUsb(*startUsb(arguments), 0);
+    return finishUsb(*startUsb(arguments, json), 0);
 }
 
 std::vector<sim::RequestRecord> UsbWorld::labTrace(const sim::EmulatedDeviceOptions& options)

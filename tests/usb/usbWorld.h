@@ -31,12 +31,12 @@ class UsbWorld : public testing_support::LoaderWorld {
     void SetUp() override;
     void TearDown() override;
 
-    // Runs the program with --json, the world's registry and drive C, and the
-    // arguments given; waits for it to end.
-    UsbRun runUsb(const std::vector<std::string>& arguments);
+    // Runs the program with --json (unless told not to), the world's registry
+    // and drive C, and the arguments given; waits for it to end.
+    UsbRun runUsb(const std::vector<std::string>& arguments, bool json = true);
     // The same, started in the background, for watch; finishUsb sends the
     // signal given (0: none) and collects it.
-    std::unique_ptr<usbtestbed::ProgramRun> startUsb(const std::vector<std::string>& arguments);
+    std::unique_ptr<usbtestbed::ProgramRun> startUsb(const std::vector<std::string>& arguments, bool json = true);
     UsbRun finishUsb(usbtestbed::ProgramRun& program, int signal);
 
     // What the device would be asked through the lab's host: the module run
