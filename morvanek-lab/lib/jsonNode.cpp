@@ -28,6 +28,8 @@ size_t distance(const std::string& a, const std::string& b)
     return row[b.size()];
 }
 
+}  // namespace
+
 std::string escapePointerToken(const std::string& token)
 {
     std::string out;
@@ -36,14 +38,14 @@ std::string escapePointerToken(const std::string& token)
             out += "~0";
         } else if (c == '/') {
             out += "~1";
+        } else if (static_cast<unsigned char>(c) < 0x20) {
+            out += fmt::format("\\u{:04X}", static_cast<int>(c));  // shown, never printed raw
         } else {
             out += c;
         }
     }
     return out;
 }
-
-}  // namespace
 
 std::optional<int64_t> parseNumberText(const std::string& raw)
 {

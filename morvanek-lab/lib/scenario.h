@@ -56,11 +56,22 @@ struct DrivePlan {
     std::vector<FilePlan> files;                  // written to a fresh temporary folder
 };
 
+// A failure injected into one kind of call: the Nth call, counted from 1 over
+// the run, or every call when the number is 0.
+struct CallFailurePlan {
+    std::string pointer;  // where it stands in the scenario, for messages
+    uint64_t number = 0;
+    int32_t status = 0;
+    std::optional<std::string> file;  // file calls: only those of this DOS path ("C:\...")
+};
+
 struct FileFaultPlan {
     int32_t everyRead = 0;
     std::vector<std::pair<unsigned, int32_t>> readNumbers;
-    int32_t sizeQuery = 0;
+    int32_t sizeQuery = 0;  // every size query of every file
     int32_t setPosition = 0;
+    std::vector<CallFailurePlan> opens;
+    std::vector<CallFailurePlan> sizeQueries;
 };
 
 struct DevicePlan {

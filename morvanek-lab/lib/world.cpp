@@ -119,6 +119,21 @@ void World::buildDrives()
     for (const auto& [number, status] : faults.readNumbers) files.failReadNumber(number, status);
     if (faults.sizeQuery != 0) files.failSizeQuery(faults.sizeQuery);
     if (faults.setPosition != 0) files.failSetPosition(faults.setPosition);
+    for (const CallFailurePlan& failure : faults.opens)
+        files.failOpenNumber(static_cast<unsigned>(failure.number), failure.status, faultFile(failure));
+    for (const CallFailurePlan& failure : faults.sizeQueries)
+        files.failSizeQueryNumber(static_cast<unsigned>(failure.number), failure.status, faultFile(failure));
+}
+
+std::filesystem::path World::faultFile(const CallFailurePlan& failure) const
+{
+    if (!failure.file) return {};
+    std::optional<std::filesystem::path> path = hostPath(*failure.file);
+    if (!path) {
+        throw ScenarioError(scenario_.file, failure.pointer + "/file",
+                            fmt::format("there is no file {} in the scenario's drives", *failure.file));
+    }
+    return *path;
 }
 
 void World::buildRegistry()
