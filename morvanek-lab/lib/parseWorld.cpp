@@ -218,7 +218,8 @@ std::string kernelKeyPath(const JsonNode& node)
 HostPlan parseHost(const JsonNode& node)
 {
     node.allowOnly({"ready", "deviceTree", "failAllocations", "failAllAllocations", "registrationFailure",
-                    "unregistrationFailure"});
+                    "unregistrationFailure", "failCreateQuery", "failSetAttribute", "failFindDevices",
+                    "failAddListener"});
     HostPlan host;
     if (auto ready = node.optionalField("ready")) host.ready = ready->flag();
     if (auto tree = node.optionalField("deviceTree")) host.deviceTree = tree->flag();
@@ -238,6 +239,10 @@ HostPlan parseHost(const JsonNode& node)
         host.unregistrationFailure = status->status();
         if (host.unregistrationFailure >= 0) status->fail("an unregistration failure is a negative status");
     }
+    if (auto calls = node.optionalField("failCreateQuery")) host.failCreateQuery = parseCallFailures(*calls, false);
+    if (auto calls = node.optionalField("failSetAttribute")) host.failSetAttribute = parseCallFailures(*calls, false);
+    if (auto calls = node.optionalField("failFindDevices")) host.failFindDevices = parseCallFailures(*calls, false);
+    if (auto calls = node.optionalField("failAddListener")) host.failAddListener = parseCallFailures(*calls, false);
     return host;
 }
 

@@ -12,6 +12,15 @@
 
 namespace lab {
 
+// A failure injected into one kind of call: the Nth call, counted from 1 over
+// the run, or every call when the number is 0.
+struct CallFailurePlan {
+    std::string pointer;  // where it stands in the scenario, for messages
+    uint64_t number = 0;
+    int32_t status = 0;
+    std::optional<std::string> file;  // file calls: only those of this DOS path ("C:\...")
+};
+
 struct HostPlan {
     bool ready = true;
     bool deviceTree = true;
@@ -19,6 +28,11 @@ struct HostPlan {
     bool failAllAllocations = false;
     int32_t registrationFailure = 0;
     int32_t unregistrationFailure = 0;
+    // The device tree's calls.
+    std::vector<CallFailurePlan> failCreateQuery;
+    std::vector<CallFailurePlan> failSetAttribute;
+    std::vector<CallFailurePlan> failFindDevices;
+    std::vector<CallFailurePlan> failAddListener;
 };
 
 struct RegistryValuePlan {
@@ -54,15 +68,6 @@ struct DrivePlan {
     char letter = 'C';
     std::optional<std::filesystem::path> folder;  // a real folder the drive stands for
     std::vector<FilePlan> files;                  // written to a fresh temporary folder
-};
-
-// A failure injected into one kind of call: the Nth call, counted from 1 over
-// the run, or every call when the number is 0.
-struct CallFailurePlan {
-    std::string pointer;  // where it stands in the scenario, for messages
-    uint64_t number = 0;
-    int32_t status = 0;
-    std::optional<std::string> file;  // file calls: only those of this DOS path ("C:\...")
 };
 
 struct FileFaultPlan {

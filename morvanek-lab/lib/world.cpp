@@ -54,6 +54,20 @@ World::World(const Scenario& scenario, const std::string& modulePath, Progress* 
     host.setTreePresent(scenario.host.deviceTree);
     host.registrationFailure = scenario.host.registrationFailure;
     host.unregistrationFailure = scenario.host.unregistrationFailure;
+    sim::TreeFaults& treeFaults = host.tree()->faults;
+    auto arm = [](sim::CallFailures& calls, const std::vector<CallFailurePlan>& plans) {
+        for (const CallFailurePlan& plan : plans) {
+            if (plan.number == 0) {
+                calls.everyCall = plan.status;
+            } else {
+                calls.byNumber[static_cast<int>(plan.number)] = plan.status;
+            }
+        }
+    };
+    arm(treeFaults.createQuery, scenario.host.failCreateQuery);
+    arm(treeFaults.setAttribute, scenario.host.failSetAttribute);
+    arm(treeFaults.findDevices, scenario.host.failFindDevices);
+    arm(treeFaults.addListener, scenario.host.failAddListener);
     try {
         buildDrives();
         buildRegistry();
