@@ -88,6 +88,66 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
     }
 }
 
+// A JSON text that is not a scenario says why, in words about the text, at
+// the place where it goes wrong.
+TEST(MalformedScenario, JsonTextErrorsKeepTheirReason)
+{
+    struct BadText {
+        std::string text;
+        const char* where;
+        const char* problem;
+    };
+    const BadText cases[] = {
+        {"{\"description\": \"open", "line 1, column 22", "a string is not closed"},
+        {"{\"description\": \"two\nlines\"}", "line 1, column 21", "control character U+000A (LF) must be escaped"},
+        {"{\"host\": {\"ready\": ture}}", "line 1, column 21", "'ture' is not a JSON value"},
+        {"{\n  // a note\n  \"steps\": []\n}", "line 2, column 3", "comments are not part of JSON"},
+        {"{\"steps\": []} {\"steps\": []}", "line 1, column 15", "text after the end of the JSON value, starting with '{'"},
+        {"{\"steps\": []} and more", "line 1, column 15", "starting with 'and'"},
+        {"{\"steps\": [", "line 1, column 12", "the text ends before the JSON value is complete"},
+        {std::string("{\"a\": 1}\0\x9F\x92", 11), "(whole file)", "not a text file: byte 0x00 at offset 8"},
+        {"\xFF\xFE{\0", "(whole file)", "not a text file: byte 0xFF at offset 0"},
+        {"", "(whole file)", "the file is empty"},
+        {" \n\t ", "(whole file)", "the file is empty"},
+        {R"({"devices": [{"name": "a", "vendorId": 99999999999999999999}]})", "/devices/0/vendorId",
+         "99999999999999999999 is out of range"},
+        {R"({"devices": [{"name": "a", "vendorId": "99999999999999999999"}]})", "/devices/0/vendorId",
+         "is out of range"},
+        {R"({"steps": [{"do": "getCurrentVersion", "status": 1e999}]})", "line 1, column 50", "1e999 is out of range"},
+        {R"({"drives": {"C": {"files": {"a": {"hex": "00"}, "a": {"hex": "01"}}}}})", "/drives/C/files/a",
+         "\"a\" appears twice"},
+        {std::string(70, '[') + std::string(70, ']'), "/0/0/0", "nested more than 64 deep"},
+    };
+    for (const BadText& bad : cases) {
+        SCOPED_TRACE(bad.text.substr(0, 60));
+        try {
+            lab::parseScenarioText(bad.text, "bad.json", ".");
+            ADD_FAILURE() << "accepted";
+        } catch (const lab::ScenarioError& error) {
+            EXPECT_EQ(error.where().rfind(bad.where, 0) == 0 || std::string(bad.where) == "(whole file)", true)
+                << error.what();
+            if (std::string(bad.where) == "(whole file)") {
+                EXPECT_EQ(error.where(), "") << error.what();
+            }
+            EXPECT_NE(error.problem().find(bad.problem), std::string::npos) << error.what();
+        }
+    }
+}
+
+TEST(MalformedScenario, ADirectoryOrAMissingFileIsNamedAsSuch)
+{
+    const std::string folder = MORVANEK_SOURCE_DIR "/tests/lab/scenarios";
+    for (const auto& [path, problem] : {std::pair<std::string, const char*>{folder, "is a directory"},
+                                        {folder + "/nowhere.json", "no such file"}}) {
+        try {
+            lab::loadScenarioFile(path);
+            ADD_FAILURE() << path << " accepted";
+        } catch (const lab::ScenarioError& error) {
+            EXPECT_EQ(error.problem().find(problem), 0u) << error.what();
+        }
+    }
+}
+
 // Numbers as JSON numbers, decimal or hexadecimal text; registry keys as the
 // kernel or the registry editor names them.
 TEST(ScenarioParser, TakesNumbersAndKeyPathsInEachOfTheirForms)
