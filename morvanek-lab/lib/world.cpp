@@ -44,8 +44,9 @@ std::optional<std::filesystem::path> findIgnoringCase(const std::filesystem::pat
 
 }  // namespace
 
-World::World(const Scenario& scenario, const std::string& modulePath, Progress* progress)
-    : scenario_(scenario), observer_(progress)
+World::World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
+             const std::string& progressPrefix)
+    : scenario_(scenario), observer_(progress, progressPrefix)
 {
     sim::Host::get().reset();
     sim::kernel::reset();
