@@ -25,6 +25,7 @@ struct CommonOptions {
     bool noProgress = false;
     std::string modulePath;
     std::vector<std::string> memory;
+    std::string engine = "linux";
 };
 
 void addCommonOptions(CLI::App& command, CommonOptions& options)
@@ -34,6 +35,11 @@ void addCommonOptions(CLI::App& command, CommonOptions& options)
     command.add_option("--memory", options.memory, "show device memory: ADDRESS:LENGTH, such as 0x0200:64 (repeatable)");
     command.add_flag("--no-progress", options.noProgress, "no progress line, even on a terminal");
     command.add_option("--module", options.modulePath, "the module to load (default: the one built beside the lab)");
+    command
+        .add_option("--engine", options.engine,
+                     "linux: the Linux module (default); windows: the real morvanek.sys under Wine; both: each "
+                     "scenario on both, failing where their reports differ")
+        ->check(CLI::IsMember({"linux", "windows", "both"}));
 }
 
 // "0x0200:64" -> address and length; throws ScenarioError-free CLI validation errors.
@@ -52,6 +58,9 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     lab::RunOptions options;
     options.modulePath = common.modulePath;
     options.trace = common.trace;
+    options.engine = common.engine == "windows" ? lab::Engine::windowsDriver
+                     : common.engine == "both"  ? lab::Engine::both
+                                                : lab::Engine::linuxModule;
     options.progress = !common.json && !common.noProgress && isatty(fileno(stdout)) != 0;
     for (const std::string& range : common.memory) options.memoryRanges.push_back(parseMemoryRange(range));
 

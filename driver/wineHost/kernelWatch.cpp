@@ -1,0 +1,188 @@
+#include "kernelWatch.h"
+
+#include <cstdint>
+#include <cstring>
+#include <map>
+
+#include "labLink.h"
+
+namespace winehost {
+
+namespace {
+
+// The kernel's own shapes, declared here: <windows.h> leaves them out.
+struct CountedText {
+    uint16_t Length;
+    uint16_t MaximumLength;
+    const wchar_t* Buffer;
+};
+struct ObjectAttributes {
+    uint32_t Length;
+    HANDLE RootDirectory;
+    const CountedText* ObjectName;
+    uint32_t Attributes;
+    void* SecurityDescriptor;
+    void* SecurityQualityOfService;
+};
+
+using ZwCreateKeyFn = LONG(WINAPI*)(HANDLE*, ULONG, const ObjectAttributes*, ULONG, const CountedText*, ULONG, ULONG*);
+using ZwQueryValueKeyFn = LONG(WINAPI*)(HANDLE, const CountedText*, ULONG, void*, ULONG, ULONG*);
+using ZwCreateFileFn = LONG(WINAPI*)(HANDLE*, ULONG, const ObjectAttributes*, void*, void*, ULONG, ULONG, ULONG, ULONG,
+                                     void*, ULONG);
+using ZwCloseFn = LONG(WINAPI*)(HANDLE);
+
+ZwCreateKeyFn gCreateKey;
+ZwQueryValueKeyFn gQueryValueKey;
+ZwCreateFileFn gCreateFile;
+ZwCloseFn gClose;
+
+struct OpenHandle {
+    std::wstring name;
+    bool key;
+};
+std::map<HANDLE, OpenHandle> gOpen;
+std::vector<std::wstring> gCreatedKeys;
+
+std::wstring textOf(const CountedText* text)
+{
+    if (text == nullptr || text->Buffer == nullptr) return L"";
+    return std::wstring(text->Buffer, text->Length / sizeof(wchar_t));
+}
+
+std::wstring nameOf(const ObjectAttributes* attributes)
+{
+    return attributes != nullptr ? textOf(attributes->ObjectName) : L"";
+}
+
+void text16(bridge::Writer& out, const std::wstring& text)
+{
+    out.text16(reinterpret_cast<const uint16_t*>(text.data()), static_cast<uint32_t>(text.size()));
+}
+
+// The lab's registry call record: kind (0 create, 1 query), key name, value
+// name, access, buffer length, result, created.
+void reportRegistryCall(uint32_t kind, const std::wstring& key, const std::wstring& value, uint32_t access,
+                        uint32_t length, LONG result, bool created)
+{
+    Payload payload;
+    payload.out().u32(kind);
+    text16(payload.out(), key);
+    text16(payload.out(), value);
+    payload.out().u32(access);
+    payload.out().u32(length);
+    payload.out().u32(static_cast<uint32_t>(result));
+    payload.out().u32(created ? 1 : 0);
+    callLab(bridge::kRegistryCall, payload.bytes());
+}
+
+constexpr wchar_t kMachinePrefix[] = L"\\Registry\\Machine\\";
+
+LONG WINAPI watchedCreateKey(HANDLE* key, ULONG access, const ObjectAttributes* attributes, ULONG titleIndex,
+                             const CountedText* keyClass, ULONG options, ULONG* disposition)
+{
+    ULONG seen = 0;
+    const LONG result = gCreateKey(key, access, attributes, titleIndex, keyClass, options, &seen);
+    if (disposition != nullptr && result >= 0) *disposition = seen;
+    const std::wstring name = nameOf(attributes);
+    const bool created = result >= 0 && seen == REG_CREATED_NEW_KEY;
+    if (result >= 0 && key != nullptr) gOpen[*key] = {name, true};
+    if (created && _wcsnicmp(name.c_str(), kMachinePrefix, wcslen(kMachinePrefix)) == 0)
+        gCreatedKeys.push_back(name.substr(wcslen(kMachinePrefix)));
+    reportRegistryCall(0, name, L"", access, 0, result, created);
+    return result;
+}
+
+LONG WINAPI watchedQueryValueKey(HANDLE key, const CountedText* valueName, ULONG informationClass, void* information,
+                                 ULONG length, ULONG* resultLength)
+{
+    const LONG result = gQueryValueKey(key, valueName, informationClass, information, length, resultLength);
+    auto open = gOpen.find(key);
+    reportRegistryCall(1, open != gOpen.end() ? open->second.name : L"", textOf(valueName), 0, length, result, false);
+    return result;
+}
+
+LONG WINAPI watchedCreateFile(HANDLE* file, ULONG access, const ObjectAttributes* attributes, void* ioStatus,
+                              void* allocationSize, ULONG fileAttributes, ULONG shareAccess, ULONG disposition,
+                              ULONG options, void* extendedAttributes, ULONG extendedLength)
+{
+    const LONG result = gCreateFile(file, access, attributes, ioStatus, allocationSize, fileAttributes, shareAccess,
+                                    disposition, options, extendedAttributes, extendedLength);
+    const std::wstring name = nameOf(attributes);
+    if (result >= 0 && file != nullptr) gOpen[*file] = {name, false};
+    Payload payload;
+    text16(payload.out(), name);
+    payload.out().u32(static_cast<uint32_t>(result));
+    callLab(bridge::kFileOpen, payload.bytes());
+    return result;
+}
+
+LONG WINAPI watchedClose(HANDLE handle)
+{
+    const LONG result = gClose(handle);
+    if (result >= 0) gOpen.erase(handle);
+    return result;
+}
+
+struct Hook {
+    const char* name;
+    void* watcher;
+    void** original;
+};
+
+}  // namespace
+
+bool watchKernelCalls(HMODULE image, std::string& problem)
+{
+    const Hook hooks[] = {
+        {"ZwCreateKey", reinterpret_cast<void*>(&watchedCreateKey), reinterpret_cast<void**>(&gCreateKey)},
+        {"ZwQueryValueKey", reinterpret_cast<void*>(&watchedQueryValueKey), reinterpret_cast<void**>(&gQueryValueKey)},
+        {"ZwCreateFile", reinterpret_cast<void*>(&watchedCreateFile), reinterpret_cast<void**>(&gCreateFile)},
+        {"ZwClose", reinterpret_cast<void*>(&watchedClose), reinterpret_cast<void**>(&gClose)},
+    };
+    auto* base = reinterpret_cast<uint8_t*>(image);
+    auto* dos = reinterpret_cast<IMAGE_DOS_HEADER*>(base);
+    auto* nt = reinterpret_cast<IMAGE_NT_HEADERS64*>(base + dos->e_lfanew);
+    const IMAGE_DATA_DIRECTORY& directory = nt->OptionalHeader.DataDirectory[IMAGE_DIRECTORY_ENTRY_IMPORT];
+    int found = 0;
+    for (auto* import = reinterpret_cast<IMAGE_IMPORT_DESCRIPTOR*>(base + directory.VirtualAddress); import->Name != 0;
+         ++import) {
+        if (_stricmp(reinterpret_cast<const char*>(base + import->Name), "ntoskrnl.exe") != 0) continue;
+        auto* names = reinterpret_cast<IMAGE_THUNK_DATA64*>(base + import->OriginalFirstThunk);
+        auto* addresses = reinterpret_cast<IMAGE_THUNK_DATA64*>(base + import->FirstThunk);
+        for (; names->u1.AddressOfData != 0; ++names, ++addresses) {
+            if (IMAGE_SNAP_BY_ORDINAL64(names->u1.Ordinal)) continue;
+            auto* byName = reinterpret_cast<IMAGE_IMPORT_BY_NAME*>(base + names->u1.AddressOfData);
+            for (const Hook& hook : hooks) {
+                if (std::strcmp(reinterpret_cast<const char*>(byName->Name), hook.name) != 0) continue;
+                DWORD previous = 0;
+                VirtualProtect(&addresses->u1.Function, sizeof(void*), PAGE_READWRITE, &previous);
+                *hook.original = reinterpret_cast<void*>(addresses->u1.Function);
+                addresses->u1.Function = reinterpret_cast<ULONGLONG>(hook.watcher);
+                VirtualProtect(&addresses->u1.Function, sizeof(void*), previous, &previous);
+                ++found;
+            }
+        }
+    }
+    if (found != static_cast<int>(sizeof(hooks) / sizeof(hooks[0]))) {
+        problem = "the image does not import every watched kernel call from ntoskrnl.exe";
+        return false;
+    }
+    return true;
+}
+
+std::vector<std::string> openKernelHandles()
+{
+    std::vector<std::string> result;
+    for (const auto& entry : gOpen) {
+        std::string name(entry.second.name.begin(), entry.second.name.end());
+        result.push_back(std::string(entry.second.key ? "key " : "file ") + name);
+    }
+    return result;
+}
+
+std::vector<std::wstring> keysCreatedByModule()
+{
+    return gCreatedKeys;
+}
+
+}  // namespace winehost
