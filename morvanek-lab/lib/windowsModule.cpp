@@ -317,8 +317,9 @@ void WindowsModule::prepareRegistry()
         writeText16(out, relativeToMachine(value->keyPath));
         writeText16(out, sim::utf8ToUtf16(value->valueName));
     }
-    // The only value the module reads that a fresh Wine prefix has: a world
-    // without it must not borrow Wine's.
+    // Of what the module reads, only the system root is in a fresh Wine
+    // prefix: a world without it must not borrow Wine's. (Its key stays:
+    // every Windows has it, and Wine's cannot be deleted whole.)
     const bool systemRoot = registry.value(kCurrentVersionKey, "SystemRoot").has_value();
     out.u32(systemRoot ? 0 : 1);
     if (!systemRoot) {
