@@ -30,11 +30,25 @@ using ZwQueryValueKeyFn = LONG(WINAPI*)(HANDLE, const CountedText*, ULONG, void*
 using ZwCreateFileFn = LONG(WINAPI*)(HANDLE*, ULONG, const ObjectAttributes*, void*, void*, ULONG, ULONG, ULONG, ULONG,
                                      void*, ULONG);
 using ZwCloseFn = LONG(WINAPI*)(HANDLE);
+using ZwReadFileFn = LONG(WINAPI*)(HANDLE, HANDLE, void*, void*, void*, void*, ULONG, void*, ULONG*);
+using ZwInformationFileFn = LONG(WINAPI*)(HANDLE, void*, void*, ULONG, ULONG);
+
+struct IoStatus {
+    LONG status;
+    ULONG_PTR information;
+};
+constexpr ULONG kFileStandardInformation = 5;
+constexpr ULONG kFilePositionInformation = 14;
 
 ZwCreateKeyFn gCreateKey;
 ZwQueryValueKeyFn gQueryValueKey;
 ZwCreateFileFn gCreateFile;
 ZwCloseFn gClose;
+ZwReadFileFn gReadFile;
+ZwInformationFileFn gQueryInformationFile;
+ZwInformationFileFn gSetInformationFile;
+KernelFaults gFaults;
+unsigned gReads;
 
 struct OpenHandle {
     std::wstring name;
@@ -42,6 +56,27 @@ struct OpenHandle {
 };
 std::map<HANDLE, OpenHandle> gOpen;
 std::vector<std::wstring> gCreatedKeys;
+
+// Case and doubled or trailing separators do not make another key.
+std::wstring folded(const std::wstring& path)
+{
+    std::wstring out;
+    for (wchar_t c : path) {
+        if (c == L'\\' && (out.empty() || out.back() == L'\\')) continue;
+        out += (c >= L'A' && c <= L'Z') ? static_cast<wchar_t>(c - L'A' + L'a') : c;
+    }
+    while (!out.empty() && out.back() == L'\\') out.pop_back();
+    return out;
+}
+
+LONG keyFault(const std::wstring& key, const std::wstring* value)
+{
+    for (const KernelFaults::KeyFault& fault : gFaults.keys) {
+        if (fault.query != (value != nullptr) || folded(fault.keyPath) != folded(key)) continue;
+        if (value == nullptr || folded(fault.valueName) == folded(*value)) return fault.status;
+    }
+    return 0;
+}
 
 std::wstring textOf(const CountedText* text)
 {
@@ -81,7 +116,8 @@ LONG WINAPI watchedCreateKey(HANDLE* key, ULONG access, const ObjectAttributes* 
                              const CountedText* keyClass, ULONG options, ULONG* disposition)
 {
     ULONG seen = 0;
-    const LONG result = gCreateKey(key, access, attributes, titleIndex, keyClass, options, &seen);
+    const LONG injected = keyFault(nameOf(attributes), nullptr);
+    const LONG result = injected < 0 ? injected : gCreateKey(key, access, attributes, titleIndex, keyClass, options, &seen);
     if (disposition != nullptr && result >= 0) *disposition = seen;
     const std::wstring name = nameOf(attributes);
     const bool created = result >= 0 && seen == REG_CREATED_NEW_KEY;
@@ -95,8 +131,11 @@ LONG WINAPI watchedCreateKey(HANDLE* key, ULONG access, const ObjectAttributes* 
 LONG WINAPI watchedQueryValueKey(HANDLE key, const CountedText* valueName, ULONG informationClass, void* information,
                                  ULONG length, ULONG* resultLength)
 {
-    const LONG result = gQueryValueKey(key, valueName, informationClass, information, length, resultLength);
     auto open = gOpen.find(key);
+    const std::wstring value = textOf(valueName);
+    const LONG injected = open != gOpen.end() ? keyFault(open->second.name, &value) : 0;
+    const LONG result = injected < 0 ? injected
+                                     : gQueryValueKey(key, valueName, informationClass, information, length, resultLength);
     reportRegistryCall(1, open != gOpen.end() ? open->second.name : L"", textOf(valueName), 0, length, result, false);
     return result;
 }
@@ -114,6 +153,44 @@ LONG WINAPI watchedCreateFile(HANDLE* file, ULONG access, const ObjectAttributes
     payload.out().u32(static_cast<uint32_t>(result));
     callLab(bridge::kFileOpen, payload.bytes());
     return result;
+}
+
+LONG WINAPI watchedReadFile(HANDLE file, HANDLE event, void* routine, void* context, void* ioStatus, void* buffer,
+                            ULONG length, void* offset, ULONG* key)
+{
+    if (gOpen.count(file) != 0) {
+        const unsigned number = ++gReads;
+        LONG injected = gFaults.everyRead;
+        for (auto it = gFaults.readNumbers.begin(); it != gFaults.readNumbers.end(); ++it) {
+            if (it->first != number) continue;
+            injected = it->second;
+            gFaults.readNumbers.erase(it);
+            break;
+        }
+        if (injected < 0) {
+            if (ioStatus != nullptr) *static_cast<IoStatus*>(ioStatus) = {injected, 0};
+            return injected;
+        }
+    }
+    return gReadFile(file, event, routine, context, ioStatus, buffer, length, offset, key);
+}
+
+LONG WINAPI watchedQueryInformationFile(HANDLE file, void* ioStatus, void* information, ULONG length, ULONG kind)
+{
+    if (kind == kFileStandardInformation && gFaults.sizeQuery < 0 && gOpen.count(file) != 0) {
+        if (ioStatus != nullptr) *static_cast<IoStatus*>(ioStatus) = {gFaults.sizeQuery, 0};
+        return gFaults.sizeQuery;
+    }
+    return gQueryInformationFile(file, ioStatus, information, length, kind);
+}
+
+LONG WINAPI watchedSetInformationFile(HANDLE file, void* ioStatus, void* information, ULONG length, ULONG kind)
+{
+    if (kind == kFilePositionInformation && gFaults.setPosition < 0 && gOpen.count(file) != 0) {
+        if (ioStatus != nullptr) *static_cast<IoStatus*>(ioStatus) = {gFaults.setPosition, 0};
+        return gFaults.setPosition;
+    }
+    return gSetInformationFile(file, ioStatus, information, length, kind);
 }
 
 LONG WINAPI watchedClose(HANDLE handle)
@@ -138,6 +215,11 @@ bool watchKernelCalls(HMODULE image, std::string& problem)
         {"ZwQueryValueKey", reinterpret_cast<void*>(&watchedQueryValueKey), reinterpret_cast<void**>(&gQueryValueKey)},
         {"ZwCreateFile", reinterpret_cast<void*>(&watchedCreateFile), reinterpret_cast<void**>(&gCreateFile)},
         {"ZwClose", reinterpret_cast<void*>(&watchedClose), reinterpret_cast<void**>(&gClose)},
+        {"ZwReadFile", reinterpret_cast<void*>(&watchedReadFile), reinterpret_cast<void**>(&gReadFile)},
+        {"ZwQueryInformationFile", reinterpret_cast<void*>(&watchedQueryInformationFile),
+         reinterpret_cast<void**>(&gQueryInformationFile)},
+        {"ZwSetInformationFile", reinterpret_cast<void*>(&watchedSetInformationFile),
+         reinterpret_cast<void**>(&gSetInformationFile)},
     };
     auto* base = reinterpret_cast<uint8_t*>(image);
     auto* dos = reinterpret_cast<IMAGE_DOS_HEADER*>(base);
@@ -168,6 +250,12 @@ bool watchKernelCalls(HMODULE image, std::string& problem)
         return false;
     }
     return true;
+}
+
+void setKernelFaults(const KernelFaults& faults)
+{
+    gFaults = faults;
+    gReads = 0;
 }
 
 std::vector<std::string> openKernelHandles()

@@ -11,6 +11,24 @@
 
 namespace winehost {
 
+// Kernel failures a scenario injects. Wine's kernel has no such controls, so
+// the watching function answers with the status in its place, exactly where
+// the lab's kernel stand-in would.
+struct KernelFaults {
+    struct KeyFault {
+        std::wstring keyPath;    // as the module names it; compared ignoring case
+        std::wstring valueName;  // empty with !query
+        bool query = false;      // the value's query fails; otherwise the key's creation
+        LONG status = 0;
+    };
+    std::vector<KeyFault> keys;
+    LONG everyRead = 0;
+    std::vector<std::pair<unsigned, LONG>> readNumbers;  // the Nth read on an open file, from 1
+    LONG sizeQuery = 0;    // FileStandardInformation queries
+    LONG setPosition = 0;  // FilePositionInformation changes
+};
+void setKernelFaults(const KernelFaults& faults);
+
 // Patches the image's import table; false when an import is missing.
 bool watchKernelCalls(HMODULE image, std::string& problem);
 // Kernel handles the module holds now, described.

@@ -16,6 +16,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <vector>
 
 #include "karvelkBridge.h"
 #include "kernelWatch.h"
@@ -63,6 +64,7 @@ ModuleExports gModule;
 uint32_t gMistakes;
 HMODULE gHost;
 HMODULE gImage;
+std::vector<HANDLE> gHeldFiles;
 
 [[noreturn]] void fail(const std::string& what)
 {
@@ -164,6 +166,29 @@ std::vector<uint8_t> prepareKernel(bridge::Reader& in)
         value.name = readText16(in);
         plan.absent.push_back(value);
     }
+    winehost::KernelFaults faults;
+    for (uint32_t count = in.u32(); count != 0 && !in.broken(); --count) {
+        winehost::KernelFaults::KeyFault fault;
+        fault.keyPath = readText16(in);
+        fault.query = in.u32() != 0;
+        fault.valueName = readText16(in);
+        fault.status = static_cast<LONG>(in.u32());
+        faults.keys.push_back(fault);
+    }
+    faults.everyRead = static_cast<LONG>(in.u32());
+    for (uint32_t count = in.u32(); count != 0 && !in.broken(); --count) {
+        const unsigned number = in.u32();
+        faults.readNumbers.emplace_back(number, static_cast<LONG>(in.u32()));
+    }
+    faults.sizeQuery = static_cast<LONG>(in.u32());
+    faults.setPosition = static_cast<LONG>(in.u32());
+    winehost::setKernelFaults(faults);
+    // Files another program holds open without sharing, as that program would.
+    for (uint32_t count = in.u32(); count != 0 && !in.broken(); --count) {
+        const std::wstring path = readText16(in);
+        HANDLE held = CreateFileW(path.c_str(), GENERIC_READ, 0, nullptr, OPEN_EXISTING, FILE_ATTRIBUTE_NORMAL, nullptr);
+        if (held != INVALID_HANDLE_VALUE) gHeldFiles.push_back(held);
+    }
     std::string problem;
     Payload reply;
     const bool applied = winehost::applyRegistry(plan, problem);
@@ -187,6 +212,8 @@ std::vector<uint8_t> finish()
     for (const std::string& handle : winehost::openKernelHandles())
         lines.push_back("kernel handle left open under Wine: " + handle);
     winehost::restoreRegistry(winehost::keysCreatedByModule());
+    for (HANDLE held : gHeldFiles) CloseHandle(held);
+    gHeldFiles.clear();
     reply.out().u32(static_cast<uint32_t>(lines.size()));
     for (const std::string& line : lines) reply.out().text(line.c_str());
     return reply.bytes();

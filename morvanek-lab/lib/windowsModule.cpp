@@ -142,26 +142,12 @@ std::u16string relativeToMachine(const std::string& keyPath)
     return sim::utf8ToUtf16(relative);
 }
 
-// Kernel faults are the stand-ins' to inject; Wine's kernel takes none.
-void refuseKernelFaults(const Scenario& scenario)
-{
-    const FileFaultPlan& files = scenario.fileFaults;
-    bool heldFile = false;
-    for (const DrivePlan& drive : scenario.drives)
-        for (const FilePlan& file : drive.files) heldFile = heldFile || file.heldOpenElsewhere;
-    if (!scenario.registry.faults.empty() || files.everyRead != 0 || !files.readNumbers.empty() ||
-        files.sizeQuery != 0 || files.setPosition != 0 || heldFile)
-        throw LabError("the Windows engine meets Wine's own kernel, which takes no injected registry or file "
-                       "faults; run this scenario on the Linux engine");
-}
-
 }  // namespace
 
 WindowsModule::WindowsModule(const Scenario& scenario, const std::map<char, std::filesystem::path>& drives,
                              BridgeServer::HostPath hostPath)
     : ModuleImage(LoadedElsewhere{})
 {
-    refuseKernelFaults(scenario);
     if (gActive != nullptr) throw LabError("a Windows engine run is already going on in this process");
     setup_ = WineSetup::find();
     process_ = std::make_unique<WineProcess>(setup_);
@@ -170,7 +156,7 @@ WindowsModule::WindowsModule(const Scenario& scenario, const std::map<char, std:
     gActive = this;
     try {
         placeDrives(drives);
-        prepareRegistry();
+        prepareKernel(scenario);
     } catch (...) {
         gActive = nullptr;
         removeDrives();
@@ -273,7 +259,7 @@ void WindowsModule::removeDrives()
     regFile_.clear();
 }
 
-void WindowsModule::prepareRegistry()
+void WindowsModule::prepareKernel(const Scenario& scenario)
 {
     sim::kernel::Registry& registry = sim::kernel::registry();
     const std::string text = sim::regfile::exportRegistryText(registry);
@@ -326,6 +312,30 @@ void WindowsModule::prepareRegistry()
         writeText16(out, relativeToMachine(kCurrentVersionKey));
         writeText16(out, u"SystemRoot");
     }
+    // The scenario's kernel faults, which the harness injects at the same calls as the stand-in.
+    out.u32(static_cast<uint32_t>(scenario.registry.faults.size()));
+    for (const RegistryFaultPlan& fault : scenario.registry.faults) {
+        writeText16(out, sim::utf8ToUtf16(fault.keyPath));
+        out.u32(fault.valueName ? 1 : 0);
+        writeText16(out, sim::utf8ToUtf16(fault.valueName.value_or("")));
+        out.u32(static_cast<uint32_t>(fault.status));
+    }
+    const FileFaultPlan& files = scenario.fileFaults;
+    out.u32(static_cast<uint32_t>(files.everyRead));
+    out.u32(static_cast<uint32_t>(files.readNumbers.size()));
+    for (const auto& [number, status] : files.readNumbers) {
+        out.u32(number);
+        out.u32(static_cast<uint32_t>(status));
+    }
+    out.u32(static_cast<uint32_t>(files.sizeQuery));
+    out.u32(static_cast<uint32_t>(files.setPosition));
+    std::vector<std::u16string> held;
+    for (const DrivePlan& drive : scenario.drives) {
+        for (const FilePlan& file : drive.files)
+            if (file.heldOpenElsewhere) held.push_back(sim::utf8ToUtf16(std::string(1, drive.letter) + ":\\" + file.path));
+    }
+    out.u32(static_cast<uint32_t>(held.size()));
+    for (const std::u16string& path : held) writeText16(out, path);
     std::vector<uint8_t> answer = call(bridge::kPrepareKernel, payload.bytes());
     bridge::Reader in = readerOf(answer);
     if (in.u32() == 0) throw LabError("the Windows engine could not set up the registry: " + readText(in));

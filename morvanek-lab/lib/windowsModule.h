@@ -39,7 +39,8 @@ public:
 private:
     void placeDrives(const std::map<char, std::filesystem::path>& drives);
     void removeDrives();
-    void prepareRegistry();
+    // The scenario's registry, the values it lacks, its kernel faults and files held elsewhere.
+    void prepareKernel(const Scenario& scenario);
 
     WineSetup setup_;
     std::unique_ptr<WineProcess> process_;
