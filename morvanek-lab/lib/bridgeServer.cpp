@@ -5,6 +5,7 @@
 #include <fmt/format.h>
 
 #include "scenarioError.h"
+#include "wireArguments.h"
 #include "sim/kernel/simKernel.h"
 #include "wineProcess.h"
 
@@ -42,45 +43,6 @@ _tLibModuleInfo gUnknownModule;
 uint8_t gUnknownBlock[16];
 // A data stage that is in none of the stream's buffers.
 uint8_t gOutsideEveryBuffer[512];
-
-// The arguments the Windows side took off its own va_list, in order.
-class WireArguments final : public sim::FormatArguments {
-public:
-    explicit WireArguments(bridge::Reader& in) : in_(in) {}
-
-    long long nextSigned(hostformat::Argument kind) override { return static_cast<long long>(number(kind)); }
-    unsigned long long nextUnsigned(hostformat::Argument kind) override { return number(kind); }
-    const void* nextPointer() override
-    {
-        return reinterpret_cast<const void*>(static_cast<uintptr_t>(number(hostformat::Argument::pointer)));
-    }
-    std::string nextText() override
-    {
-        if (!expect(hostformat::Argument::text)) return "(null)";
-        bool isNull = false;
-        std::string text = readText(in_, &isNull);
-        return isNull ? "(null)" : text;
-    }
-    std::string nextText16() override
-    {
-        if (!expect(hostformat::Argument::text16)) return "(null)";
-        bool isNull = false;
-        std::u16string text = readText16(in_, &isNull);
-        return isNull ? "(null)" : sim::utf16ToUtf8(text.data(), text.size());
-    }
-
-private:
-    bool expect(hostformat::Argument kind)
-    {
-        if (broken_) return false;
-        broken_ = in_.u32() != static_cast<uint32_t>(kind);
-        return !broken_;
-    }
-    uint64_t number(hostformat::Argument kind) { return expect(kind) ? in_.u64() : 0; }
-
-    bridge::Reader& in_;
-    bool broken_ = false;
-};
 
 std::string textOrNull(const std::string& text, bool isNull)
 {
