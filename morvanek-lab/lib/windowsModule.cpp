@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <iterator>
 #include <fstream>
 
 #include <fmt/format.h>
@@ -231,9 +232,10 @@ void WindowsModule::placeDrives(const std::map<char, std::filesystem::path>& dri
              !error && it != std::filesystem::recursive_directory_iterator(); it.increment(error)) {
             if (!it->is_regular_file()) continue;
             std::filesystem::path target = setup_.prefix / "drive_c";
-            for (const auto& part : std::filesystem::relative(it->path(), folder)) {
-                target = childIgnoringCase(target, part.string());
-                if (part == it->path().filename()) break;
+            const std::filesystem::path relative = std::filesystem::relative(it->path(), folder);
+            for (auto part = relative.begin(); part != relative.end(); ++part) {
+                target = childIgnoringCase(target, part->string());
+                if (std::next(part) == relative.end()) break;  // the file itself
                 if (!std::filesystem::exists(target)) {
                     std::filesystem::create_directory(target);
                     placedFolders_.push_back(target);
