@@ -42,6 +42,7 @@ struct PackageEvent {
     std::string secondName;
     std::string mainName;
     tModuleMain moduleMain = nullptr;
+    size_t liveBlocks = 0;  // host allocations live when the event came, which shows what ran before it
 };
 
 // Counts live blocks; can be told to fail the Nth allocation from now on, or all.
@@ -107,6 +108,9 @@ public:
     std::vector<UsbDeviceSim*> allDevices() const;
     size_t liveQueries() const;
     size_t liveListeners() const { return listeners_.size(); }
+    // The records now registered, in the order they were added.
+    const std::vector<ListenerRecord*>& listenerRecords() const { return listeners_; }
+    int queryIdReads() const { return queryIdReads_; }
     int addListenerCalls() const { return addListenerCalls_; }
     int removeListenerCalls() const { return removeListenerCalls_; }
     std::vector<std::string> describeLeftovers() const;
@@ -124,6 +128,7 @@ private:
     std::vector<ListenerRecord*> listeners_;
     std::deque<Event> pending_;
     uint32_t nextQueryId_ = 0x51;
+    int queryIdReads_ = 0;
     int addListenerCalls_ = 0;
     int removeListenerCalls_ = 0;
     bool delivering_ = false;
