@@ -11,6 +11,7 @@
 #include "lib/examine.h"
 #include "lib/jsonNode.h"
 #include "lib/lab.h"
+#include "lib/pictures.h"
 #include "lib/reports.h"
 
 namespace {
@@ -26,6 +27,7 @@ struct CommonOptions {
     std::string modulePath;
     std::vector<std::string> memory;
     std::string engine = "linux";
+    std::string svgFolder;
 };
 
 void addCommonOptions(CLI::App& command, CommonOptions& options)
@@ -40,6 +42,8 @@ void addCommonOptions(CLI::App& command, CommonOptions& options)
                      "linux: the Linux module (default); windows: the real morvanek.sys under Wine; both: each "
                      "scenario on both, failing where their reports differ")
         ->check(CLI::IsMember({"linux", "windows", "both"}));
+    command.add_option("--svg", options.svgFolder,
+                       "write pictures into this folder: per device a flash map and a timeline on the bus model");
 }
 
 // "0x0200:64" -> address and length; throws ScenarioError-free CLI validation errors.
@@ -67,9 +71,11 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     std::vector<lab::ScenarioResult> results;
     for (size_t i = 0; i < files.size(); ++i) {
         results.push_back(lab::runScenarioFile(files[i], options));
+        std::string pictures = common.svgFolder.empty() ? "" : lab::writePicturesOf(results.back(), common.svgFolder);
         if (common.json) continue;
         if (i != 0) std::fputs("\n", stdout);
         lab::printTextReport(stdout, results.back(), options);
+        if (!pictures.empty()) fmt::print("{}\n", pictures);
         std::fflush(stdout);
     }
     if (common.json) {
