@@ -69,6 +69,25 @@ std::wstring folded(const std::wstring& path)
     return out;
 }
 
+// A DOS path as a file call names it, without the kernel's "\\??\\" in front.
+std::wstring foldedFile(std::wstring path)
+{
+    if (path.rfind(L"\\??\\", 0) == 0) path = path.substr(4);
+    for (wchar_t& c : path) c = c == L'/' ? L'\\' : c;
+    return folded(path);
+}
+
+// The status a counted file-call fault injects into this call, or 0.
+LONG fileCallFault(std::vector<KernelFaults::FileCallFault>& faults, const std::wstring& file)
+{
+    for (KernelFaults::FileCallFault& fault : faults) {
+        if (!fault.file.empty() && foldedFile(fault.file) != foldedFile(file)) continue;
+        ++fault.seen;
+        if (fault.number == 0 || fault.seen == fault.number) return fault.status;
+    }
+    return 0;
+}
+
 LONG keyFault(const std::wstring& key, const std::wstring* value)
 {
     for (const KernelFaults::KeyFault& fault : gFaults.keys) {
@@ -144,9 +163,11 @@ LONG WINAPI watchedCreateFile(HANDLE* file, ULONG access, const ObjectAttributes
                               void* allocationSize, ULONG fileAttributes, ULONG shareAccess, ULONG disposition,
                               ULONG options, void* extendedAttributes, ULONG extendedLength)
 {
-    const LONG result = gCreateFile(file, access, attributes, ioStatus, allocationSize, fileAttributes, shareAccess,
-                                    disposition, options, extendedAttributes, extendedLength);
     const std::wstring name = nameOf(attributes);
+    const LONG injected = fileCallFault(gFaults.opens, name);
+    const LONG result = injected < 0 ? injected
+                                     : gCreateFile(file, access, attributes, ioStatus, allocationSize, fileAttributes,
+                                                   shareAccess, disposition, options, extendedAttributes, extendedLength);
     if (result >= 0 && file != nullptr) gOpen[*file] = {name, false};
     Payload payload;
     text16(payload.out(), name);
@@ -177,9 +198,14 @@ LONG WINAPI watchedReadFile(HANDLE file, HANDLE event, void* routine, void* cont
 
 LONG WINAPI watchedQueryInformationFile(HANDLE file, void* ioStatus, void* information, ULONG length, ULONG kind)
 {
-    if (kind == kFileStandardInformation && gFaults.sizeQuery < 0 && gOpen.count(file) != 0) {
-        if (ioStatus != nullptr) *static_cast<IoStatus*>(ioStatus) = {gFaults.sizeQuery, 0};
-        return gFaults.sizeQuery;
+    auto open = gOpen.find(file);
+    if (kind == kFileStandardInformation && open != gOpen.end()) {
+        const LONG counted = fileCallFault(gFaults.sizeQueries, open->second.name);
+        const LONG injected = counted < 0 ? counted : gFaults.sizeQuery;
+        if (injected < 0) {
+            if (ioStatus != nullptr) *static_cast<IoStatus*>(ioStatus) = {injected, 0};
+            return injected;
+        }
     }
     return gQueryInformationFile(file, ioStatus, information, length, kind);
 }

@@ -26,6 +26,16 @@ struct KernelFaults {
     std::vector<std::pair<unsigned, LONG>> readNumbers;  // the Nth read on an open file, from 1
     LONG sizeQuery = 0;    // FileStandardInformation queries
     LONG setPosition = 0;  // FilePositionInformation changes
+    // The Nth open or size query (0: every one) of one file, or of any file
+    // when no file is named; each counts its own calls.
+    struct FileCallFault {
+        unsigned long long number = 0;
+        LONG status = 0;
+        std::wstring file;  // a DOS path, "C:\dir\file"; compared ignoring case and slash direction
+        unsigned long long seen = 0;
+    };
+    std::vector<FileCallFault> opens;
+    std::vector<FileCallFault> sizeQueries;
 };
 void setKernelFaults(const KernelFaults& faults);
 

@@ -182,13 +182,22 @@ std::vector<uint8_t> prepareKernel(bridge::Reader& in)
     }
     faults.sizeQuery = static_cast<LONG>(in.u32());
     faults.setPosition = static_cast<LONG>(in.u32());
-    winehost::setKernelFaults(faults);
     // Files another program holds open without sharing, as that program would.
     for (uint32_t count = in.u32(); count != 0 && !in.broken(); --count) {
         const std::wstring path = readText16(in);
         HANDLE held = CreateFileW(path.c_str(), GENERIC_READ, 0, nullptr, OPEN_EXISTING, FILE_ATTRIBUTE_NORMAL, nullptr);
         if (held != INVALID_HANDLE_VALUE) gHeldFiles.push_back(held);
     }
+    for (auto* calls : {&faults.opens, &faults.sizeQueries}) {
+        for (uint32_t count = in.u32(); count != 0 && !in.broken(); --count) {
+            winehost::KernelFaults::FileCallFault fault;
+            fault.number = in.u64();
+            fault.status = static_cast<LONG>(in.u32());
+            fault.file = readText16(in);
+            calls->push_back(fault);
+        }
+    }
+    winehost::setKernelFaults(faults);
     std::string problem;
     Payload reply;
     const bool applied = winehost::applyRegistry(plan, problem);

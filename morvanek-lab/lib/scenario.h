@@ -12,6 +12,15 @@
 
 namespace lab {
 
+// A failure injected into one kind of call: the Nth call, counted from 1 over
+// the run, or every call when the number is 0.
+struct CallFailurePlan {
+    std::string pointer;  // where it stands in the scenario, for messages
+    uint64_t number = 0;
+    int32_t status = 0;
+    std::optional<std::string> file;  // file calls: only those of this DOS path ("C:\...")
+};
+
 struct HostPlan {
     bool ready = true;
     bool deviceTree = true;
@@ -19,6 +28,11 @@ struct HostPlan {
     bool failAllAllocations = false;
     int32_t registrationFailure = 0;
     int32_t unregistrationFailure = 0;
+    // The device tree's calls.
+    std::vector<CallFailurePlan> failCreateQuery;
+    std::vector<CallFailurePlan> failSetAttribute;
+    std::vector<CallFailurePlan> failFindDevices;
+    std::vector<CallFailurePlan> failAddListener;
 };
 
 struct RegistryValuePlan {
@@ -59,8 +73,10 @@ struct DrivePlan {
 struct FileFaultPlan {
     int32_t everyRead = 0;
     std::vector<std::pair<unsigned, int32_t>> readNumbers;
-    int32_t sizeQuery = 0;
+    int32_t sizeQuery = 0;  // every size query of every file
     int32_t setPosition = 0;
+    std::vector<CallFailurePlan> opens;
+    std::vector<CallFailurePlan> sizeQueries;
 };
 
 struct DevicePlan {
@@ -68,6 +84,9 @@ struct DevicePlan {
     sim::EmulatedDeviceOptions options;  // loader product ID, USB vendor ID, attribute 21, faults, timing
     std::string timingName;              // "fullSpeed", "highSpeed" or empty
     bool present = true;
+    // How it starts the first time it is plugged in: held in its loader, or
+    // running its firmware (enumerating with its identity block's IDs).
+    sim::PhysicalDevice::PowerUp startsIn = sim::PhysicalDevice::PowerUp::loader;
     std::vector<uint8_t> flashDump;  // loaded at address 0 first
     std::optional<sim::IdentityValues> identity;
     std::vector<sim::MemoryBytes> memory;  // last, over the dump and the identity
@@ -98,6 +117,9 @@ struct StepPlan {
     MainRoute route = MainRoute::moduleMain;
     uint32_t reason = 0;
     std::string device;
+    // plugIn: how the device starts; unset: as the device's startsIn the
+    // first time, as its flash says after that.
+    std::optional<sim::PhysicalDevice::PowerUp> startsIn;
     uint32_t state = 0;
     int32_t statusIn = 0;
     uint32_t newest = 0;

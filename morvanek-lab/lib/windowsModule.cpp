@@ -338,6 +338,14 @@ void WindowsModule::prepareKernel(const Scenario& scenario)
     }
     out.u32(static_cast<uint32_t>(held.size()));
     for (const std::u16string& path : held) writeText16(out, path);
+    for (const auto* calls : {&files.opens, &files.sizeQueries}) {
+        out.u32(static_cast<uint32_t>(calls->size()));
+        for (const CallFailurePlan& failure : *calls) {
+            out.u64(failure.number);
+            out.u32(static_cast<uint32_t>(failure.status));
+            writeText16(out, sim::utf8ToUtf16(failure.file.value_or("")));
+        }
+    }
     std::vector<uint8_t> answer = call(bridge::kPrepareKernel, payload.bytes());
     bridge::Reader in = readerOf(answer);
     if (in.u32() == 0) throw LabError("the Windows engine could not set up the registry: " + readText(in));

@@ -25,7 +25,7 @@ public:
     // Throws LabError when the module cannot be loaded or a folder not made.
     // The Windows engine's module is morvanek.sys under Wine (modulePath is the Linux one's).
     World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
-          Engine engine = Engine::linuxModule);
+          const std::string& progressPrefix = {}, Engine engine = Engine::linuxModule);
     ~World();
     World(const World&) = delete;
     World& operator=(const World&) = delete;
@@ -33,6 +33,7 @@ public:
     sim::ModuleImage& module() { return *module_; }
     RunObserver& observer() { return observer_; }
     sim::PhysicalDevice& device(const std::string& name);
+    const DevicePlan& plan(const std::string& name) const;
     std::vector<std::shared_ptr<sim::PhysicalDevice>>& devices() { return devices_; }
     const std::vector<std::vector<uint8_t>>& flashBefore() const { return flashBefore_; }
 
@@ -51,6 +52,8 @@ private:
     void buildDrives();
     void buildRegistry();
     void buildDevices();
+    // The host file a file fault names; empty when it names none.
+    std::filesystem::path faultFile(const CallFailurePlan& failure) const;
 
     const Scenario& scenario_;
     RunObserver observer_;

@@ -69,12 +69,26 @@ private:
 
 class UsbDeviceSim;
 
-// Which operations of the tree fail. Call numbers count from 1.
+// A call told to fail: every call with one status, or chosen calls (numbered
+// from 1 over the tree's life, calls with a failed incoming status included)
+// each with its own.
+struct CallFailures {
+    tStatus everyCall = 0;
+    std::map<int, tStatus> byNumber;
+
+    tStatus statusFor(int call) const
+    {
+        auto it = byNumber.find(call);
+        return it != byNumber.end() ? it->second : everyCall;
+    }
+};
+
+// Which operations of the tree fail.
 struct TreeFaults {
-    bool createQuery = false;
-    bool setAttribute = false;
-    bool findDevices = false;
-    std::set<int> addListenerCalls;
+    CallFailures createQuery;  // it has no status to fail: a failing call returns no query
+    CallFailures setAttribute; // on any query of the tree
+    CallFailures findDevices;
+    CallFailures addListener;
     bool removeListener = false;
 };
 
@@ -101,13 +115,18 @@ public:
     // deliverPendingEvents(), never from inside the call that caused them.
     void queueArrival(UsbDeviceSim& device);
     void queueRemoval(UsbDeviceSim& device);
-    void adopt(std::unique_ptr<UsbDeviceSim> device);  // kept alive, not yet present
+    // Kept alive, not yet present; placed in the search order right after
+    // `after` (an earlier enumeration of the same device) when given.
+    void adopt(std::unique_ptr<UsbDeviceSim> device, const UsbDeviceSim* after = nullptr);
     void deliverPendingEvents();
 
     std::vector<UsbDeviceSim*> presentDevices() const;
     std::vector<UsbDeviceSim*> allDevices() const;
     size_t liveQueries() const;
     size_t liveListeners() const { return listeners_.size(); }
+    int createQueryCalls() const { return createQueryCalls_; }
+    int setAttributeCalls() const { return setAttributeCalls_; }
+    int findDevicesCalls() const { return findDevicesCalls_; }
     // The records now registered, in the order they were added.
     const std::vector<ListenerRecord*>& listenerRecords() const { return listeners_; }
     int queryIdReads() const { return queryIdReads_; }
@@ -128,6 +147,9 @@ private:
     std::vector<ListenerRecord*> listeners_;
     std::deque<Event> pending_;
     uint32_t nextQueryId_ = 0x51;
+    int createQueryCalls_ = 0;
+    int setAttributeCalls_ = 0;
+    int findDevicesCalls_ = 0;
     int queryIdReads_ = 0;
     int addListenerCalls_ = 0;
     int removeListenerCalls_ = 0;
