@@ -39,6 +39,7 @@ struct CommonOptions {
     bool noProgress = false;
     std::string modulePath;
     std::vector<std::string> memory;
+    std::string engine = "linux";
     std::string svgFolder;
 };
 
@@ -72,6 +73,11 @@ void addCommonOptions(CLI::App& command, CommonOptions& options)
         ->allow_extra_args(false);
     command.add_flag("--no-progress", options.noProgress, "no progress line, even on a terminal");
     command.add_option("--module", options.modulePath, "the module to load (default: the one built beside the lab)");
+    command
+        .add_option("--engine", options.engine,
+                     "linux: the Linux module (default); windows: the real morvanek.sys under Wine; both: each "
+                     "scenario on both, failing where their reports differ")
+        ->check(CLI::IsMember({"linux", "windows", "both"}));
     command.add_option("--svg", options.svgFolder,
                        "write pictures into this folder: per device a flash map and a timeline on the bus model");
 }
@@ -103,6 +109,9 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     lab::RunOptions options;
     options.modulePath = common.modulePath;
     options.trace = common.trace;
+    options.engine = common.engine == "windows" ? lab::Engine::windowsDriver
+                     : common.engine == "both"  ? lab::Engine::both
+                                                : lab::Engine::linuxModule;
     options.progress = progressWanted(common);
     for (const std::string& range : common.memory) options.memoryRanges.push_back(parseMemoryRange(range));
 

@@ -185,6 +185,11 @@ json scenarioJson(const ScenarioResult& result, const RunOptions& options)
     for (const ExpectationFailure& failure : result.expectations.failures)
         failures.push_back({{"place", failure.place}, {"what", failure.what}});
     out["expectations"] = {{"checked", result.expectations.checked}, {"failures", failures}};
+    if (result.engines) {
+        out["engines"] = {{"linuxSeconds", result.engines->linuxSeconds},
+                          {"windowsSeconds", result.engines->windowsSeconds},
+                          {"differences", result.engines->differences}};
+    }
     return out;
 }
 

@@ -1,11 +1,13 @@
 #include "lab.h"
 
 #include <algorithm>
+#include <chrono>
 #include <cstdlib>
 
 #include <fmt/format.h>
 #include <iostream>
 
+#include "engineComparison.h"
 #include "findings.h"
 #include "runner.h"
 #include "scenarioError.h"
@@ -18,10 +20,13 @@ int ScenarioResult::exitCode() const
 {
     if (!labError.empty()) return kExitLabError;
     if (!invalid.empty()) return kExitScenarioInvalid;
-    return expectations.failures.empty() ? kExitSuccess : kExitExpectationFailed;
+    const bool disagree = engines && !engines->differences.empty();
+    return expectations.failures.empty() && !disagree ? kExitSuccess : kExitExpectationFailed;
 }
 
-ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
+namespace {
+
+ScenarioResult runOn(const Scenario& scenario, const RunOptions& options, Engine engine)
 {
     ScenarioResult result;
     result.file = scenario.file;
@@ -31,7 +36,7 @@ ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
     if (options.scenarioCount > 1) prefix = fmt::format("[{}/{}] {}", options.scenarioNumber, options.scenarioCount, result.file);
     try {
         Progress* display = options.progressDisplay != nullptr ? options.progressDisplay : &progress;
-        World world(*result.scenario, options.modulePath, options.progress ? display : nullptr, prefix);
+        World world(*result.scenario, options.modulePath, options.progress ? display : nullptr, prefix, engine);
         std::vector<StepRecord> steps = runSteps(*result.scenario, world);
         result.record = takeRecord(*result.scenario, world, std::move(steps));
         result.record.findings = findFindings(result.record);
@@ -45,6 +50,29 @@ ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
         result.labError = std::string("the lab failed: ") + error.what();
     }
     progress.clear();
+    return result;
+}
+
+double secondsSince(std::chrono::steady_clock::time_point start)
+{
+    return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+}
+
+}  // namespace
+
+ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
+{
+    if (options.engine != Engine::both) return runOn(scenario, options, options.engine);
+    auto start = std::chrono::steady_clock::now();
+    ScenarioResult result = runOn(scenario, options, Engine::linuxModule);
+    EngineComparison engines;
+    engines.linuxSeconds = secondsSince(start);
+    start = std::chrono::steady_clock::now();
+    ScenarioResult windows = runOn(scenario, options, Engine::windowsDriver);
+    engines.windowsSeconds = secondsSince(start);
+    if (!windows.labError.empty() && result.labError.empty()) result.labError = "Windows engine: " + windows.labError;
+    if (result.labError.empty() && result.invalid.empty()) engines.differences = compareEngineRuns(result, windows, options);
+    result.engines = engines;
     return result;
 }
 

@@ -8,6 +8,7 @@
 #include <utility>
 #include <vector>
 
+#include "engine.h"
 #include "expectations.h"
 #include "progress.h"
 #include "runRecord.h"
@@ -35,6 +36,14 @@ struct RunOptions {
     Progress* progressDisplay = nullptr;  // where progress goes instead of standard error (tests)
     bool trace = false;      // the request trace, for people
     std::vector<MemoryRange> memoryRanges;  // shown per device in the report
+    Engine engine = Engine::linuxModule;
+};
+
+// Both engines' runs of one scenario side by side.
+struct EngineComparison {
+    double linuxSeconds = 0;
+    double windowsSeconds = 0;
+    std::vector<std::string> differences;  // where the two reports differ; empty when they agree
 };
 
 struct ScenarioResult {
@@ -44,6 +53,7 @@ struct ScenarioResult {
     std::string labError;  // the lab could not run it
     RunRecord record;
     ExpectationOutcome expectations;
+    std::optional<EngineComparison> engines;  // with Engine::both; the record is the Linux engine's
 
     int exitCode() const;
 };

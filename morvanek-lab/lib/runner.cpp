@@ -218,6 +218,7 @@ RunRecord takeRecord(const Scenario& scenario, World& world, std::vector<StepRec
 
     record.leftovers = host.leftovers();
     for (const std::string& handle : sim::kernel::openHandleDescriptions()) record.leftovers.push_back("open handle: " + handle);
+    for (const std::string& line : world.engineLeftovers()) record.leftovers.push_back(line);
     record.misuse = host.misuse;
     for (const std::string& report : sim::kernel::misuseReports()) record.misuse.push_back(report);
     record.liveBlocks = host.allocator.liveBlocks();

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include "deviceStory.h"
+#include "engineComparison.h"
 #include "reports.h"
 
 namespace lab {
@@ -174,8 +175,13 @@ void printTextReport(std::FILE* out, const ScenarioResult& result, const RunOpti
     printLines(out, "lab found", findings, "nothing the module could not see");
     if (!record.createdKeys.empty()) printLines(out, "keys created", record.createdKeys, "");
     printLines(out, "left behind", record.leftovers, "nothing");
+    printEngineComparison(out, result);
 
     const ExpectationOutcome& expectations = result.expectations;
+    if (expectations.failures.empty() && result.exitCode() != kExitSuccess) {
+        fmt::print(out, "FAIL  {}: the two engines' reports differ\n", result.file);
+        return;
+    }
     if (expectations.failures.empty()) {
         fmt::print(out, "PASS  {} ({} expectation(s) met)\n", result.file, expectations.checked);
         return;

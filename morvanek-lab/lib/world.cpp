@@ -6,6 +6,7 @@
 #include <fmt/format.h>
 
 #include "scenarioError.h"
+#include "windowsModule.h"
 #include "regfile/registryText.h"
 #include "sim/kernel/simKernel.h"
 
@@ -45,7 +46,7 @@ std::optional<std::filesystem::path> findIgnoringCase(const std::filesystem::pat
 }  // namespace
 
 World::World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
-             const std::string& progressPrefix)
+             const std::string& progressPrefix, Engine engine)
     : scenario_(scenario), observer_(progress, progressPrefix)
 {
     sim::Host::get().reset();
@@ -73,7 +74,14 @@ World::World(const Scenario& scenario, const std::string& modulePath, Progress* 
         buildDrives();
         buildRegistry();
         buildDevices();
-        module_ = std::make_unique<sim::ModuleImage>(modulePath.empty() ? sim::ModuleImage::defaultPath() : modulePath);
+        if (engine == Engine::windowsDriver) {
+            auto windows = std::make_unique<WindowsModule>(
+                scenario, drives_, [this](const std::string& dosPath) { return hostPath(dosPath); });
+            windows_ = windows.get();
+            module_ = std::move(windows);
+        } else {
+            module_ = std::make_unique<sim::ModuleImage>(modulePath.empty() ? sim::ModuleImage::defaultPath() : modulePath);
+        }
     } catch (const std::runtime_error& error) {
         // The destructor does not run for a half-built world.
         for (const auto& folder : temporaryFolders_) std::filesystem::remove_all(folder);
@@ -185,6 +193,11 @@ void World::buildDevices()
         if (plan.present) device->plugIn(*sim::Host::get().tree(), plan.startsIn);
         devices_.push_back(device);
     }
+}
+
+std::vector<std::string> World::engineLeftovers()
+{
+    return windows_ != nullptr ? windows_->finish() : std::vector<std::string>{};
 }
 
 void World::armAllocationFaults()

@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "engine.h"
 #include "runObserver.h"
 #include "scenario.h"
 #include "sim/device/enumeratedDevice.h"
@@ -17,11 +18,14 @@
 
 namespace lab {
 
+class WindowsModule;
+
 class World {
 public:
     // Throws LabError when the module cannot be loaded or a folder not made.
+    // The Windows engine's module is morvanek.sys under Wine (modulePath is the Linux one's).
     World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
-          const std::string& progressPrefix = {});
+          const std::string& progressPrefix = {}, Engine engine = Engine::linuxModule);
     ~World();
     World(const World&) = delete;
     World& operator=(const World&) = delete;
@@ -36,6 +40,10 @@ public:
     // The host file a DOS path ("C:\WINDOWS\x.bin") stands for, ignoring case
     // as Windows does; nullopt when the drive or file is not there.
     std::optional<std::filesystem::path> hostPath(const std::string& dosPath) const;
+
+    // What the engine itself still holds for the module after the steps (the
+    // Windows side's own count); ends the engine, so call it last.
+    std::vector<std::string> engineLeftovers();
 
     // Applied last, just before the steps, so that they count the steps' allocations only.
     void armAllocationFaults();
@@ -54,6 +62,7 @@ private:
     std::vector<std::shared_ptr<sim::PhysicalDevice>> devices_;
     std::vector<std::vector<uint8_t>> flashBefore_;
     std::unique_ptr<sim::ModuleImage> module_;
+    WindowsModule* windows_ = nullptr;  // module_, when it is the Windows engine's
 };
 
 }  // namespace lab

@@ -1,8 +1,9 @@
 // printf-style formatting of host log and debug lines. The host's %S is a
 // UTF-16 string, which the C library's formatter cannot take on Linux, so
-// each conversion is formatted on its own.
+// each conversion is formatted on its own. The arguments come from a
+// va_list here, or already taken off another ABI's va_list by the
+// Windows-side host.
 #include <cstdio>
-#include <cstring>
 
 #include "../kernel/kernelUtf16.h"
 #include "simHost.h"
@@ -28,8 +29,49 @@ std::u16string utf8ToUtf16(const std::string& text)
     return kernel::toUtf16(text);
 }
 
+namespace {
+
+// The arguments of this process's own variadic call.
+class VaListArguments final : public FormatArguments {
+public:
+    explicit VaListArguments(va_list arguments) { va_copy(arguments_, arguments); }
+    ~VaListArguments() { va_end(arguments_); }
+
+    long long nextSigned(hostformat::Argument kind) override
+    {
+        if (kind == hostformat::Argument::signedLongLong) return va_arg(arguments_, long long);
+        if (kind == hostformat::Argument::signedLong) return va_arg(arguments_, long);
+        return va_arg(arguments_, int);
+    }
+    unsigned long long nextUnsigned(hostformat::Argument kind) override
+    {
+        if (kind == hostformat::Argument::unsignedLongLong) return va_arg(arguments_, unsigned long long);
+        if (kind == hostformat::Argument::unsignedLong) return va_arg(arguments_, unsigned long);
+        return va_arg(arguments_, unsigned);
+    }
+    const void* nextPointer() override { return va_arg(arguments_, void*); }
+    std::string nextText() override
+    {
+        const char* text = va_arg(arguments_, const char*);
+        return text == nullptr ? "(null)" : text;
+    }
+    std::string nextText16() override { return utf16ToUtf8(va_arg(arguments_, const char16_t*)); }
+
+private:
+    va_list arguments_;
+};
+
+}  // namespace
+
 std::string formatHostMessage(const char* format, va_list arguments)
 {
+    VaListArguments source(arguments);
+    return formatHostMessage(format, source);
+}
+
+std::string formatHostMessage(const char* format, FormatArguments& arguments)
+{
+    using hostformat::Argument;
     std::string out;
     char piece[512];
     for (const char* p = format; *p != 0;) {
@@ -37,75 +79,56 @@ std::string formatHostMessage(const char* format, va_list arguments)
             out += *p++;
             continue;
         }
-        const char* start = p++;
-        if (*p == '%') {
+        const hostformat::Directive read = hostformat::readDirective(p);
+        if (read.literalPercent) {
             out += '%';
-            ++p;
+            p = read.end;
             continue;
         }
-        while (*p != 0 && std::strchr("-+ #0", *p)) ++p;
-        while ((*p >= '0' && *p <= '9') || *p == '.') ++p;
-        int longs = 0;
-        bool half = false;
-        bool size = false;
-        while (*p == 'l' || *p == 'h' || *p == 'z' || *p == 'I') {
-            if (*p == 'l') ++longs;
-            if (*p == 'h') half = true;
-            if (*p == 'z') size = true;
-            ++p;
-        }
-        char conversion = *p;
-        if (conversion == 0) break;
-        ++p;
-        std::string directive(start, p);
-        switch (conversion) {
-        case 'd':
-        case 'i':
-            if (longs >= 2 || size) {
-                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, long long));
-            } else if (longs == 1) {
-                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, long));
-            } else {
-                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, int));
-            }
+        if (read.end == nullptr) break;
+        const std::string directive(p, read.end);
+        p = read.end;
+        switch (read.argument) {
+        case Argument::signedInt:
+        case Argument::character:
+            std::snprintf(piece, sizeof piece, directive.c_str(), static_cast<int>(arguments.nextSigned(read.argument)));
             out += piece;
             break;
-        case 'u':
-        case 'x':
-        case 'X':
-        case 'o':
-            if (longs >= 2 || size) {
-                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, unsigned long long));
-            } else if (longs == 1) {
-                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, unsigned long));
-            } else {
-                std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, unsigned));
-            }
+        case Argument::signedLong:
+            std::snprintf(piece, sizeof piece, directive.c_str(), static_cast<long>(arguments.nextSigned(read.argument)));
             out += piece;
             break;
-        case 'c':
-            std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, int));
+        case Argument::signedLongLong:
+            std::snprintf(piece, sizeof piece, directive.c_str(), arguments.nextSigned(read.argument));
             out += piece;
             break;
-        case 'p':
-            std::snprintf(piece, sizeof piece, directive.c_str(), va_arg(arguments, void*));
+        case Argument::unsignedInt:
+            std::snprintf(piece, sizeof piece, directive.c_str(),
+                          static_cast<unsigned>(arguments.nextUnsigned(read.argument)));
             out += piece;
             break;
-        case 's': {
-            const char* text = va_arg(arguments, const char*);
-            if (longs == 1) {
-                out += utf16ToUtf8(reinterpret_cast<const char16_t*>(text));
-            } else {
-                out += text == nullptr ? "(null)" : text;
-            }
+        case Argument::unsignedLong:
+            std::snprintf(piece, sizeof piece, directive.c_str(),
+                          static_cast<unsigned long>(arguments.nextUnsigned(read.argument)));
+            out += piece;
             break;
-        }
-        case 'S':
-            out += utf16ToUtf8(va_arg(arguments, const char16_t*));
+        case Argument::unsignedLongLong:
+            std::snprintf(piece, sizeof piece, directive.c_str(), arguments.nextUnsigned(read.argument));
+            out += piece;
             break;
-        default:
+        case Argument::pointer:
+            std::snprintf(piece, sizeof piece, directive.c_str(), arguments.nextPointer());
+            out += piece;
+            break;
+        case Argument::text:
+            out += arguments.nextText();
+            break;
+        case Argument::text16:
+            out += arguments.nextText16();
+            break;
+        case Argument::none:
             out += directive;  // unknown conversion: shown as written
-            (void)half;
+            break;
         }
     }
     return out;

@@ -16,6 +16,7 @@
 #include "../../host/deviceTree.h"
 #include "../../host/karvelk.h"
 #include "../../host/moduleRecords.h"
+#include "formatDirective.h"
 
 namespace sim {
 
@@ -228,8 +229,22 @@ private:
     bool treePresent_ = true;
 };
 
+// Where a format's arguments come from, one per directive that takes one.
+class FormatArguments {
+public:
+    virtual long long nextSigned(hostformat::Argument kind) = 0;
+    virtual unsigned long long nextUnsigned(hostformat::Argument kind) = 0;
+    virtual const void* nextPointer() = 0;
+    virtual std::string nextText() = 0;    // "(null)" for a null text
+    virtual std::string nextText16() = 0;  // UTF-16, as UTF-8
+
+protected:
+    ~FormatArguments() = default;
+};
+
 // printf-style formatting as the host does it: %S takes a UTF-16 string.
 std::string formatHostMessage(const char* format, va_list arguments);
+std::string formatHostMessage(const char* format, FormatArguments& arguments);
 std::string utf16ToUtf8(const char16_t* text);
 std::string utf16ToUtf8(const char16_t* text, size_t length);
 std::u16string utf8ToUtf16(const std::string& text);

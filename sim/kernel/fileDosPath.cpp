@@ -104,7 +104,11 @@ DosPathResolution resolveDosPath(const std::u16string& name, const std::map<char
     char letter = device.size() == 2 && device[1] == u':' && device[0] < 0x80 ? static_cast<char>(device[0]) : 0;
     letter = static_cast<char>(std::toupper(static_cast<unsigned char>(letter)));
     auto drive = drives.find(letter);
-    if (letter < 'A' || letter > 'Z' || drive == drives.end()) return failure(fileStatus::objectPathNotFound);
+    // The device is looked up as one name in the DOS devices directory: when
+    // nothing follows it ("\??\C:/dir/file", slashes being no separators) a
+    // missing device is a missing name, not a missing path.
+    if (letter < 'A' || letter > 'Z' || drive == drives.end())
+        return failure(parts.size() == 1 ? fileStatus::objectNameNotFound : fileStatus::objectPathNotFound);
 
     // "C:" and "C:\" both name the drive's root; otherwise a trailing
     // backslash asks for a directory.

@@ -110,6 +110,11 @@ const std::vector<FileOpenRecord>& FileSystem::opens() const
     return fileWorld().opens;
 }
 
+void FileSystem::noteOpen(const FileOpenRecord& record)
+{
+    fileWorld().opens.push_back(record);
+}
+
 const std::vector<FileReadRecord>& FileSystem::reads() const
 {
     return fileWorld().reads;

@@ -77,6 +77,8 @@ class FileSystem {
     void clearFaults();
 
     const std::vector<FileOpenRecord>& opens() const;
+    // An open that another kernel answered, logged beside this one's.
+    void noteOpen(const FileOpenRecord& record);
     const std::vector<FileReadRecord>& reads() const;
     const std::vector<FileInformationRecord>& informationCalls() const;
 

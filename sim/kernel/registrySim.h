@@ -93,6 +93,9 @@ public:
 
     // Every ZwCreateKey and ZwQueryValueKey since the last reset, in order.
     const std::vector<RegistryCall>& calls() const { return calls_; }
+    // A call that another kernel answered (Wine's, for the lab's Windows
+    // engine), logged beside this one's so that reports read both alike.
+    void noteCall(const RegistryCall& call) { calls_.push_back(call); }
     // The names of the keys that ZwCreateKey created, as the module passed them.
     std::vector<std::string> createdKeys() const;
     // Every key below the machine hive that holds values or lies below its

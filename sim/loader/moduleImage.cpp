@@ -51,7 +51,7 @@ ModuleImage::~ModuleImage()
 
 void* ModuleImage::resolve(const char* name) const
 {
-    return dlsym(handle_, name);
+    return handle_ != nullptr ? dlsym(handle_, name) : nullptr;
 }
 
 NTSTATUS ModuleImage::initialize(const std::string& registryPath)

@@ -23,7 +23,7 @@ public:
 
     // The module built alongside this program, unless a path is given.
     explicit ModuleImage(const std::string& path = defaultPath());
-    ~ModuleImage();
+    virtual ~ModuleImage();
     ModuleImage(const ModuleImage&) = delete;
     ModuleImage& operator=(const ModuleImage&) = delete;
 
@@ -44,6 +44,12 @@ public:
     GetVersionFn getOldestCompatibleVersion = nullptr;
     CompareVersionFn compareVersion = nullptr;
     CompareFirmwareVersionFn compareFirmwareVersion = nullptr;
+
+protected:
+    // For a module loaded elsewhere (the lab's Windows engine): no library is
+    // opened, and the subclass sets the function pointers.
+    struct LoadedElsewhere {};
+    explicit ModuleImage(LoadedElsewhere) {}
 
 private:
     void* handle_ = nullptr;

@@ -73,6 +73,7 @@ TEST_F(OpenTest, RefusedNamesOpenNothing)
         {u"\\??\\C:\\drivers/image.bin", status::objectNameInvalid, "a slash is no separator"},
         {u"\\??\\C:\\drivers\\\xD800image.bin", status::objectNameInvalid, "a lone surrogate"},
         {u"\\??\\Q:\\drivers\\image.bin", status::objectPathNotFound, "an unmapped drive"},
+        {u"\\??\\C:/drivers/image.bin", status::objectNameNotFound, "slashes only: one device name, not found"},
         {u"\\??\\", status::objectNameInvalid, "nothing after the prefix"},
         {u"C:\\drivers\\image.bin", status::objectNameInvalid, "no DOS devices prefix"},
     };
