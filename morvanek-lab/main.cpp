@@ -12,6 +12,7 @@
 #include "lib/jsonNode.h"
 #include "lib/lab.h"
 #include "lib/reports.h"
+#include "lib/sweep.h"
 
 namespace {
 
@@ -77,6 +78,38 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     return lab::combinedExitCode(results);
 }
 
+struct SweepCommand {
+    std::string file;
+    std::string faults = "all";
+    std::string reproducers = "sweep-reproducers";
+};
+
+int sweepScenario(const SweepCommand& command, const CommonOptions& common)
+{
+    lab::SweepKindChoice choice = lab::chooseSweepKinds(command.faults);
+    if (!choice.unknown.empty()) {
+        std::vector<std::string> names;
+        for (lab::SweepKind kind : lab::allSweepKinds()) names.push_back(lab::sweepKindName(kind));
+        fmt::print(stderr, "morvanek-lab: --faults: \"{}\" is not a kind of fault; the kinds are {}, or all or none\n",
+                   choice.unknown, fmt::join(names, ", "));
+        return lab::kExitScenarioInvalid;
+    }
+    lab::SweepOptions options;
+    options.modulePath = common.modulePath;
+    options.kinds = choice.kinds;
+    options.progress = !common.json && !common.noProgress && isatty(fileno(stdout)) != 0;
+    options.reproducerFolder = command.reproducers;
+    lab::SweepResult result = lab::sweepScenarioFile(command.file, options);
+    if (common.json) {
+        std::cout << lab::sweepJsonReport(result).dump(2) << "\n";
+        if (!result.invalid.empty()) fmt::print(stderr, "morvanek-lab: invalid scenario: {}\n", result.invalid);
+        if (!result.labError.empty()) fmt::print(stderr, "morvanek-lab: {}: {}\n", result.file, result.labError);
+    } else {
+        lab::printSweepReport(stdout, result);
+    }
+    return result.exitCode();
+}
+
 }  // namespace
 
 int main(int argc, char** argv)
@@ -94,6 +127,19 @@ int main(int argc, char** argv)
 
     CLI::App* demo = app.add_subcommand("demo", "run the bundled demonstration: two devices, one on each loader");
     addCommonOptions(*demo, common);
+
+    SweepCommand sweepCommand;
+    CLI::App* sweep = app.add_subcommand(
+        "sweep", "run a scenario once clean, then once per place a fault can strike, and check every run against what "
+                 "the loader promises");
+    sweep->add_option("scenario", sweepCommand.file, "the scenario file (JSON)")->required();
+    sweep->add_option("--faults", sweepCommand.faults,
+                      "kinds of fault, separated by commas; \"all\" (the default) or \"none\" (the clean run only)");
+    sweep->add_option("--reproducers", sweepCommand.reproducers,
+                      "where the scenarios that reproduce violations are written (default: sweep-reproducers)");
+    sweep->add_flag("--json", common.json, "write one machine-readable report, and nothing else, on standard output");
+    sweep->add_flag("--no-progress", common.noProgress, "no progress line, even on a terminal");
+    sweep->add_option("--module", common.modulePath, "the module to load (default: the one built beside the lab)");
 
     lab::InspectOptions inspect;
     CLI::App* inspectCommand = app.add_subcommand("inspect", "decode an image file or an identity block");
@@ -122,6 +168,7 @@ int main(int argc, char** argv)
     try {
         if (run->parsed()) return runScenarios(files, common);
         if (demo->parsed()) return runScenarios({MORVANEK_LAB_DEMO_SCENARIO}, common);
+        if (sweep->parsed()) return sweepScenario(sweepCommand, common);
         if (image->parsed()) return lab::inspectImage(inspect, stdout);
         if (identity->parsed()) return lab::inspectIdentity(inspect, stdout);
     } catch (const CLI::ValidationError& error) {

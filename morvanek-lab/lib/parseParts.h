@@ -12,7 +12,7 @@ namespace lab {
 HostPlan parseHost(const JsonNode& node);
 RegistryPlan parseRegistry(const JsonNode& node, const std::filesystem::path& directory);
 std::vector<DrivePlan> parseDrives(const JsonNode& node, const std::filesystem::path& directory);
-FileFaultPlan parseFileFaults(const JsonNode& node);
+FileFaultPlan parseFileFaults(const JsonNode& node, const std::filesystem::path& directory);
 std::vector<DevicePlan> parseDevices(const JsonNode& node, const std::filesystem::path& directory);
 std::vector<StepPlan> parseSteps(const JsonNode& node, const std::vector<DevicePlan>& devices);
 Expectations parseExpectations(const JsonNode& node, const std::vector<DevicePlan>& devices);
@@ -22,6 +22,9 @@ Expectations parseExpectations(const JsonNode& node, const std::vector<DevicePla
 std::vector<uint8_t> readNamedFile(const JsonNode& node, const std::filesystem::path& directory,
                                    size_t maximumSize);
 std::filesystem::path resolveNamedPath(const JsonNode& node, const std::filesystem::path& directory);
+
+// A status a fault injects: it must be a failure, negative as a 32-bit value.
+int32_t failureStatus(const JsonNode& node);
 
 // "\Registry\Machine\..." or "HKEY_LOCAL_MACHINE\..." (or "HKLM\...") in the kernel's form.
 std::string kernelKeyPath(const JsonNode& node);

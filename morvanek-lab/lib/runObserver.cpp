@@ -34,6 +34,7 @@ void RunObserver::catchUp()
 void RunObserver::stepBegins()
 {
     catchUp();
+    ++step_;
     last_ = Owner{};
 }
 
@@ -53,8 +54,11 @@ void RunObserver::onRequest(int index, const sim::PhysicalDevice& device, const 
         watched.enumeration = enumeration;
         ++watched.updates;
     }
+    // Unplugged at its very first request: the enumeration is gone already, but that request began an update.
+    if (enumeration == nullptr && watched.updates == 0) ++watched.updates;
     int update = std::max(watched.updates - 1, 0);
     watched.updateOf.push_back(update);
+    watched.stepOf.push_back(step_);
     last_ = Owner{index, update};
 
     if (record.kind == sim::RequestKind::Write && record.outcome >= 0 && !record.data.empty()) {

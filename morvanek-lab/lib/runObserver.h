@@ -25,6 +25,7 @@ public:
     const std::vector<Owner>& openOwners() const { return openOwners_; }
     const std::vector<Owner>& registryOwners() const { return registryOwners_; }
     const std::vector<int>& updateOf(int device) const { return devices_.at(device).updateOf; }
+    const std::vector<int>& stepOf(int device) const { return devices_.at(device).stepOf; }
     int updates(int device) const { return devices_.at(device).updates; }
     const std::vector<WriteNotTaken>& writesNotTaken(int device) const { return devices_.at(device).writesNotTaken; }
 
@@ -34,6 +35,7 @@ private:
         const sim::EnumeratedDevice* enumeration = nullptr;
         int updates = 0;
         std::vector<int> updateOf;
+        std::vector<int> stepOf;
         std::vector<WriteNotTaken> writesNotTaken;
     };
 
@@ -44,6 +46,7 @@ private:
     Progress* progress_;
     std::vector<Watched> devices_;
     Owner last_;
+    int step_ = -1;
     std::vector<Owner> logOwners_;
     std::vector<Owner> openOwners_;
     std::vector<Owner> registryOwners_;

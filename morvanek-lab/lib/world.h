@@ -37,6 +37,8 @@ public:
 
     // Applied last, just before the steps, so that they count the steps' allocations only.
     void armAllocationFaults();
+    // Allocation attempts before the steps began, which the faults do not count.
+    size_t allocationAttemptsBeforeSteps() const { return attemptsBeforeSteps_; }
 
 private:
     void buildDrives();
@@ -50,6 +52,7 @@ private:
     std::vector<std::shared_ptr<sim::PhysicalDevice>> devices_;
     std::vector<std::vector<uint8_t>> flashBefore_;
     std::unique_ptr<sim::ModuleImage> module_;
+    size_t attemptsBeforeSteps_ = 0;
 };
 
 }  // namespace lab

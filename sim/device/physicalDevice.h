@@ -75,6 +75,7 @@ public:
     std::vector<RequestRecord> trace;
     std::chrono::microseconds elapsed{0};  // virtual time spent on requests
     std::vector<std::string> notes;         // what the lab may want to show; not errors
+    uint64_t transferBufferRequests = 0;    // allocateBuffer calls on its streams, over its life
     // Called after each request has been carried out (or refused), before it
     // goes to the trace and before a restart re-enumerates the device; the
     // flash already shows the request's effect. For observers such as the lab.

@@ -24,6 +24,7 @@ struct FileOpenRecord {
     std::filesystem::path hostPath; // what it resolved to; empty when it did not resolve
     NTSTATUS status = 0;
     HANDLE handle = nullptr; // set only when the open succeeded
+    std::vector<uint8_t> bytes; // what the open saw: reads through its handle bring these
 };
 
 struct FileReadRecord {
@@ -69,6 +70,12 @@ class FileSystem {
     void failSizeQuery(NTSTATUS status);   // FileStandardInformation queries
     void failSetPosition(NTSTATUS status); // FilePositionInformation changes
     void clearFaults();
+    // The Nth read from now brings at most `bytes` bytes and reports success,
+    // even before the end of the file.
+    void shortenRead(unsigned nth, uint32_t bytes);
+    // Once the file has been opened `opens` more times, it holds `bytes`: a
+    // file replaced between two opens, as by an installer running meanwhile.
+    void changeContentAfterOpens(const std::filesystem::path& hostFile, unsigned opens, std::vector<uint8_t> bytes);
 
     const std::vector<FileOpenRecord>& opens() const;
     const std::vector<FileReadRecord>& reads() const;

@@ -1,0 +1,33 @@
+// What one injected fault must lead to, beyond the invariants every run keeps:
+// the update it strikes ends silently or with the line its place calls for,
+// carrying the status of the fault; a device plugged in again after an unplug
+// ends as it would have without the fault.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "runInvariants.h"
+
+namespace lab {
+
+struct FaultExpectation {
+    enum class Ending {
+        any,            // only the invariants
+        failsSilently,  // the update ends without a restart and without a message
+        failsLogged,    // the update ends without a restart, logging line 451 last
+    };
+
+    int device = -1;  // by its place in the scenario; -1: no device in particular
+    int update = 0;   // which of the device's updates the fault strikes
+    Ending ending = Ending::any;
+    std::optional<int32_t> status;              // what line 451 must report
+    int verificationLine = 0;                   // 421 or 436 before line 451
+    uint32_t verificationBlock = 0;             // the block that line names
+    std::optional<std::string> finalMode;       // the mode the device must end in
+};
+
+std::vector<InvariantViolation> checkFaultExpectation(const RunRecord& record, const FaultExpectation& expected);
+
+}  // namespace lab
