@@ -13,25 +13,12 @@
 
 #include <nlohmann/json.hpp>
 
+#include "tests/lab/labProcess.h"
+
 namespace {
 
-struct Outcome {
-    int exitCode = -1;
-    std::string output;  // standard output only
-};
-
-Outcome runLab(const std::string& arguments)
-{
-    Outcome outcome;
-    std::string command = std::string(MORVANEK_LAB_EXECUTABLE) + " " + arguments + " 2>/dev/null";
-    FILE* pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr) return outcome;
-    char buffer[4096];
-    for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) outcome.output.append(buffer, n);
-    int status = pclose(pipe);
-    outcome.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    return outcome;
-}
+using lab_tests::Outcome;
+using lab_tests::runLab;
 
 const std::string kScenarios = MORVANEK_LAB_SCENARIOS;
 const std::string kBad = MORVANEK_SOURCE_DIR "/tests/lab/scenarios";
