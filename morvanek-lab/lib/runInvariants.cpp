@@ -168,6 +168,8 @@ private:
             verified_[address] = equal;
             if (!equal) readBackDiffered_ = true;
         }
+        // What a short data stage left out was not read back either.
+        if (request.data.size() < request.length) readBackDiffered_ = true;
     }
 
     // The marker says "this image is complete and verified": every byte of the
@@ -241,8 +243,8 @@ private:
                                 firstFailure_->outcome));
         }
         if (verification && !readBackDiffered_)
-            add("failure message", fmt::format("line {} reports a verification failure, but every block read back as "
-                                               "written",
+            add("failure message", fmt::format("line {} reports a verification failure, but every block read back in full "
+                                               "as written",
                                                lines[0]));
     }
 
@@ -257,7 +259,7 @@ private:
     bool programming_ = false;  // the first erase was sent
     bool markerWritten_ = false;
     bool restarted_ = false;
-    bool readBackDiffered_ = false;
+    bool readBackDiffered_ = false;  // a read-back differed from what was written, or came short
 };
 
 // A device that runs its firmware holds, from the firmware base, the image of

@@ -17,6 +17,7 @@ constexpr KindName kKinds[] = {
     {SweepKind::lostStatus, "lostStatus"},
     {SweepKind::readCorruption, "readCorruption"},
     {SweepKind::stuckBits, "stuckBits"},
+    {SweepKind::shortRead, "shortRead"},
     {SweepKind::deadErase, "deadErase"},
     {SweepKind::allocation, "allocation"},
     {SweepKind::releaseFailure, "releaseFailure"},

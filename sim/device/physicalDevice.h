@@ -84,6 +84,7 @@ public:
     const EmulatedDeviceOptions& options() const { return options_; }
     const LoaderFlashLayout* layout() const { return findLoaderFlashLayout(options_.loaderProductId); }
     uint64_t requestCount() const { return requests_; }
+    uint64_t readRequestCount() const { return readRequests_; }
     int loaderComebacks() const { return loaderComebacks_; }
     bool unplugged() const { return unplugged_; }
     // The enumeration that currently stands for the device, or null when it is unplugged.
@@ -121,6 +122,7 @@ private:
     EmulatedDeviceOptions options_;
     EnumeratedDevice* current_ = nullptr;
     uint64_t requests_ = 0;
+    uint64_t readRequests_ = 0;
     int loaderComebacks_ = 0;
     bool unplugged_ = false;
 };

@@ -1,12 +1,14 @@
 // The sweep's own checks: each invariant catches the fault it is for in a run
 // record broken on purpose, a fault's expectation catches a wrong ending, and
-// the command catches a deliberately broken build of the module and writes a
+// the command catches a deliberately broken build of the module (one that takes every block as
+// verified) and writes a
 // scenario that reproduces what it found.
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <filesystem>
 #include <functional>
+#include <ostream>
 #include <set>
 #include <string>
 #include <vector>
@@ -100,6 +102,11 @@ struct BrokenRun {
     std::function<void(lab::RunRecord&)> breakIt;
     const char* rule;  // the invariant that must catch it
 };
+
+void PrintTo(const BrokenRun& run, std::ostream* out)
+{
+    *out << run.name;
+}
 
 class RunInvariants : public testing::TestWithParam<BrokenRun> {};
 
@@ -267,7 +274,7 @@ TEST(SweepCommand, RunsEveryFaultPositionOfTheScenarioAndFindsNoViolation)
     }
 }
 
-TEST(SweepCommand, CatchesAModuleThatDoesNotCompareItsReadBackAndWritesAReproducer)
+TEST(SweepCommand, CatchesAModuleThatTakesEveryBlockAsVerifiedAndWritesAReproducer)
 {
     const std::string folder = freshFolder("sweep-unverified");
     const std::string unverified = std::string("--module ") + MORVANEK_UNVERIFIED_MODULE;
