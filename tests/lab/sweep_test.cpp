@@ -1,8 +1,7 @@
 // The sweep's own checks: each invariant catches the fault it is for in a run
 // record broken on purpose, a fault's expectation catches a wrong ending, and
-// the command catches a deliberately broken build of the module (one that takes every block as
-// verified) and writes a
-// scenario that reproduces what it found.
+// the command catches a deliberately broken build of the module (one that
+// takes every block as verified) and writes a scenario that reproduces it.
 #include <gtest/gtest.h>
 
 #include <algorithm>
