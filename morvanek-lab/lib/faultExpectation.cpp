@@ -52,8 +52,8 @@ std::vector<InvariantViolation> checkFaultExpectation(const RunRecord& record, c
                                                update, linesText(lines)));
         return out;
     }
-    bool last451 = !lines.empty() && logLineNumber(lines.back()->entry.location) == 451;
-    bool statusRight = last451 && (!expected.status || loggedStatus(lines.back()->entry.message) == expected.status);
+    bool lastRight = !lines.empty() && logLineNumber(lines.back()->entry.location) == expected.line;
+    bool statusRight = lastRight && (!expected.status || loggedStatus(lines.back()->entry.message) == expected.status);
     bool verificationRight = expected.verificationLine == 0;
     if (expected.verificationLine != 0 && lines.size() == 2) {
         const LogRecord& first = *lines.front();
@@ -66,7 +66,8 @@ std::vector<InvariantViolation> checkFaultExpectation(const RunRecord& record, c
                                  ? fmt::format("line {} naming page {}, then ", expected.verificationLine,
                                                expected.verificationBlock)
                                  : std::string();
-        wanted += "line 451" + (expected.status ? fmt::format(" with status {}", *expected.status) : std::string());
+        wanted += fmt::format("line {}", expected.line) +
+                  (expected.status ? fmt::format(" with status {}", *expected.status) : std::string());
         add("failure message", fmt::format("{} should have logged {}; it logged {}", update, wanted, linesText(lines)));
     }
     return out;

@@ -16,13 +16,14 @@ struct FaultExpectation {
     enum class Ending {
         any,            // only the invariants
         failsSilently,  // the update ends without a restart and without a message
-        failsLogged,    // the update ends without a restart, logging line 451 last
+        failsLogged,    // the update ends without a restart, logging `line` last
     };
 
     int device = -1;  // by its place in the scenario; -1: no device in particular
     int update = 0;   // which of the device's updates the fault strikes
     Ending ending = Ending::any;
-    std::optional<int32_t> status;              // what line 451 must report
+    int line = 451;                             // the line a logged failure ends with
+    std::optional<int32_t> status;              // what that line must report
     int verificationLine = 0;                   // 421 or 436 before line 451
     uint32_t verificationBlock = 0;             // the block that line names
     std::optional<std::string> finalMode;       // the mode the device must end in

@@ -50,9 +50,21 @@ sim::RequestKind requestKind(const JsonNode& node)
 sim::DeviceFaults parseFaults(const JsonNode& node)
 {
     node.allowOnly({"stallRequests", "stallKinds", "readCorruptions", "shortReads", "unplugAtRequest",
-                    "refuseOpenStream", "refuseAllocateBuffer", "lostStatus", "stuckBits", "deadErases",
-                    "failTransferBuffer", "failFreeBuffer", "failCloseStream"});
+                    "refuseOpenStream", "refuseAllocateBuffer", "failAttributes", "failGetDescriptor", "lostStatus",
+                    "stuckBits", "deadErases", "failTransferBuffer", "failFreeBuffer", "failCloseStream"});
     sim::DeviceFaults faults;
+    if (auto list = node.optionalField("failAttributes")) {
+        for (const JsonNode& item : list->itemsOrOne()) {
+            item.allowOnly({"id", "status"});
+            JsonNode id = item.field("id");
+            uint64_t attribute = id.unsignedNumber(0xFFFFFFFF);
+            if (attribute != 1 && attribute != 2 && attribute != 21)
+                id.fail(fmt::format("the host reads attributes 1 (vendor ID), 2 (product ID) and 21 of a device; not {}",
+                                    attribute));
+            faults.attributeFailures[static_cast<uint32_t>(attribute)] = failureStatus(item.field("status"));
+        }
+    }
+    if (auto status = node.optionalField("failGetDescriptor")) faults.descriptorFailure = failureStatus(*status);
     auto numbers = [&](const char* name, const char* counted, std::set<uint64_t>& into) {
         if (auto list = node.optionalField(name)) {
             for (const JsonNode& item : list->itemsOrOne()) {

@@ -24,8 +24,10 @@ constexpr KindName kKinds[] = {
     {SweepKind::registryOpen, "registryOpen"},
     {SweepKind::registryQuery, "registryQuery"},
     {SweepKind::registryOverflow, "registryOverflow"},
+    {SweepKind::fileOpen, "fileOpen"},
     {SweepKind::fileRead, "fileRead"},
     {SweepKind::fileShortRead, "fileShortRead"},
+    {SweepKind::fileSizeQuery, "fileSizeQuery"},
     {SweepKind::imageChange, "imageChange"},
 };
 

@@ -23,6 +23,9 @@ constexpr const char* kAccessDenied = "0xC0000022";
 constexpr const char* kInsufficientResources = "0xC000009A";
 constexpr const char* kBufferOverflow = "0x80000005";
 constexpr const char* kDeviceDataError = "0xC000009C";
+constexpr const char* kIoDeviceError = "0xC0000185";
+constexpr int kLineImageNotOpened = 385;
+constexpr int kFileStandardInformation = 5;
 constexpr int32_t kImageRefused = -50150;
 constexpr int32_t kImageReadFailed = -50207;
 constexpr int32_t kUnverified = -50152;
@@ -119,7 +122,10 @@ public:
             imageChanges();
             break;
         case SweepKind::fileOpen:
+            fileOpens();
+            break;
         case SweepKind::fileSizeQuery:
+            sizeQueries();
             break;
         }
     }
@@ -373,9 +379,62 @@ private:
             }
             // Reads of the programming open (the update's second) end the update with line 451 and -50207.
             if (open == clean_.fileOpens.end() || open->owner.device < 0) continue;
-            std::vector<size_t> opens = updateOpens(open->owner);
-            size_t openIndex = static_cast<size_t>(open - clean_.fileOpens.begin());
-            if (opens.size() < 2 || openIndex == opens.front()) continue;
+            if (!isProgrammingOpen(static_cast<size_t>(open - clean_.fileOpens.begin()))) continue;
+            run.expected.device = open->owner.device;
+            run.expected.update = open->owner.update;
+            run.expected.ending = Ending::failsLogged;
+            run.expected.status = kImageReadFailed;
+        }
+    }
+
+    // An update's second open is the one it programs from.
+    bool isProgrammingOpen(size_t openIndex) const
+    {
+        const FileOpenSeen& seen = clean_.fileOpens[openIndex];
+        if (seen.owner.device < 0) return false;
+        std::vector<size_t> opens = updateOpens(seen.owner);
+        return opens.size() >= 2 && openIndex != opens.front();
+    }
+
+    // The header read's open failing ends the update without a message; the
+    // programming open's failing logs line 385.
+    void fileOpens()
+    {
+        for (size_t n = 1; n <= clean_.fileOpens.size(); ++n) {
+            const FileOpenSeen& seen = clean_.fileOpens[n - 1];
+            if (seen.open.status < 0) continue;  // failed already
+            FaultRun& run = add(SweepKind::fileOpen, fmt::format("open {} ({}{})", n, withoutObjectPrefix(seen.open.dosPath),
+                                                                 ownerText(seen.owner)));
+            append(objectField(run.scenario, "fileFaults"), "failOpen",
+                   Document{{"number", n}, {"status", kAccessDenied}});
+            if (seen.owner.device < 0) continue;
+            run.expected.device = seen.owner.device;
+            run.expected.update = seen.owner.update;
+            if (isProgrammingOpen(n - 1)) {
+                run.expected.ending = Ending::failsLogged;
+                run.expected.line = kLineImageNotOpened;
+            } else if (updateOpens(seen.owner).front() == n - 1) {
+                run.expected.ending = Ending::failsSilently;
+            }
+        }
+    }
+
+    // The programming open's size query failing is a failed image read: line 451 with -50207.
+    void sizeQueries()
+    {
+        size_t n = 0;
+        for (const sim::kernel::FileInformationRecord& call : clean_.fileInformationCalls) {
+            if (call.set || call.informationClass != kFileStandardInformation) continue;
+            ++n;
+            auto open = std::find_if(clean_.fileOpens.begin(), clean_.fileOpens.end(),
+                                     [&](const FileOpenSeen& seen) { return seen.open.handle == call.handle; });
+            bool known = open != clean_.fileOpens.end();
+            FaultRun& run = add(SweepKind::fileSizeQuery,
+                                fmt::format("size query {} ({}{})", n, known ? withoutObjectPrefix(open->open.dosPath) : "?",
+                                            known ? ownerText(open->owner) : ""));
+            append(objectField(run.scenario, "fileFaults"), "failSizeQuery",
+                   Document{{"number", n}, {"status", kIoDeviceError}});
+            if (!known || !isProgrammingOpen(static_cast<size_t>(open - clean_.fileOpens.begin()))) continue;
             run.expected.device = open->owner.device;
             run.expected.update = open->owner.update;
             run.expected.ending = Ending::failsLogged;

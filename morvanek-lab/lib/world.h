@@ -44,6 +44,8 @@ private:
     void buildDrives();
     void buildRegistry();
     void buildDevices();
+    // The host file a file fault names; empty when it names none.
+    std::filesystem::path faultFile(const CallFailurePlan& failure) const;
 
     const Scenario& scenario_;
     RunObserver observer_;

@@ -6,6 +6,7 @@
 #include <map>
 #include <vector>
 
+#include "fileCallFaults.h"
 #include "fileSim.h"
 
 namespace sim::kernel {
@@ -23,6 +24,8 @@ struct FileFaults {
     NTSTATUS sizeQuery = 0;
     NTSTATUS setPosition = 0;
     std::map<uint64_t, uint32_t> shortReads; // by read count: at most that many bytes
+    FileCallFaults opens;       // ZwCreateFile calls with a well-formed request
+    FileCallFaults sizeQueries; // FileStandardInformation queries
 };
 
 // A file whose content is replaced once it has been opened a number of times.
