@@ -1,5 +1,6 @@
 #include "sweep.h"
 
+#include <algorithm>
 #include <chrono>
 #include <fstream>
 #include <map>

@@ -264,11 +264,12 @@ TEST(SweepCommand, RunsEveryFaultPositionOfTheScenarioAndFindsNoViolation)
         {"failedRequest", 25}, {"unplug", 25}, {"lostStatus", 25}, {"readCorruption", 2},
         {"stuckBits", 2},      {"deadErase", 2}, {"releaseFailure", 2},
     };
-    for (const auto& [kind, runs] : expectedRuns) {
+    for (const auto& expected : expectedRuns) {
+        const std::string kind = expected.first;
         auto entry = std::find_if(report["kinds"].begin(), report["kinds"].end(),
                                   [&](const nlohmann::json& k) { return k["kind"] == kind; });
         ASSERT_NE(entry, report["kinds"].end()) << kind;
-        EXPECT_EQ((*entry)["runs"], runs) << kind;
+        EXPECT_EQ((*entry)["runs"], expected.second) << kind;
         EXPECT_EQ((*entry)["violatingRuns"], 0) << kind;
     }
 }
