@@ -27,7 +27,9 @@ std::vector<InvariantViolation> checkFaultExpectation(const RunRecord& record, c
     const DeviceRecord& device = record.devices[static_cast<size_t>(expected.device)];
     auto add = [&](const char* rule, const std::string& what) { out.push_back({rule, device.name, what}); };
 
-    if (expected.finalMode && device.mode != *expected.finalMode)
+    bool updatedAgain = device.updates > expected.update + 1;
+    bool modeDue = expected.finalMode && (updatedAgain || !expected.finalModeAfterAnotherUpdate);
+    if (modeDue && device.mode != *expected.finalMode)
         add("did not recover", fmt::format("it ended in {} mode; without the fault it ends in {} mode", device.mode,
                                            *expected.finalMode));
     if (expected.ending == FaultExpectation::Ending::any) return out;

@@ -27,6 +27,9 @@ struct FaultExpectation {
     int verificationLine = 0;                   // 421 or 436 before line 451
     uint32_t verificationBlock = 0;             // the block that line names
     std::optional<std::string> finalMode;       // the mode the device must end in
+    // finalMode holds only once the device was updated again after the fault
+    // (a module that no longer listens never sees it plugged in again).
+    bool finalModeAfterAnotherUpdate = false;
 };
 
 std::vector<InvariantViolation> checkFaultExpectation(const RunRecord& record, const FaultExpectation& expected);

@@ -49,13 +49,12 @@ void RunObserver::onRequest(int index, const sim::PhysicalDevice& device, const 
 {
     catchUp();
     Watched& watched = devices_[static_cast<size_t>(index)];
-    const sim::EnumeratedDevice* enumeration = device.current();
-    if (enumeration != nullptr && enumeration != watched.enumeration) {
-        watched.enumeration = enumeration;
+    // By the enumeration the request came through: a device unplugged at a
+    // request has none by the time it is observed.
+    if (record.enumeration != watched.enumeration) {
+        watched.enumeration = record.enumeration;
         ++watched.updates;
     }
-    // Unplugged at its very first request: the enumeration is gone already, but that request began an update.
-    if (enumeration == nullptr && watched.updates == 0) ++watched.updates;
     int update = std::max(watched.updates - 1, 0);
     watched.updateOf.push_back(update);
     watched.stepOf.push_back(step_);

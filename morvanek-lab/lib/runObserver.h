@@ -32,7 +32,7 @@ public:
 private:
     struct Watched {
         std::string name;
-        const sim::EnumeratedDevice* enumeration = nullptr;
+        uint64_t enumeration = 0;  // of the last request seen
         int updates = 0;
         std::vector<int> updateOf;
         std::vector<int> stepOf;

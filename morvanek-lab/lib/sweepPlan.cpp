@@ -208,6 +208,7 @@ private:
             // update does not repair again: the device stays in loader mode. The table shows it.
             bool identityWrite = !place.programming && place.request->kind == sim::RequestKind::Write;
             if (!identityWrite) run.expected.finalMode = entry.mode;
+            run.expected.finalModeAfterAnotherUpdate = true;
         }
     }
 
@@ -221,9 +222,35 @@ private:
                (request.wIndex - layout.firmwareBase) % kBlockSize == 0 && request.data.size() == request.length;
     }
 
+    // Whether the clean run read the whole block back, every read succeeding:
+    // only then does a fault in it end in a verification failure rather than
+    // in the failure of a later read.
+    bool readBackComplete(const RequestPlace& place) const
+    {
+        const DeviceRecord& entry = device(place.device);
+        uint32_t covered = 0;
+        for (size_t i = place.index + 1; i < entry.trace.size() && covered < place.request->length; ++i) {
+            const sim::RequestRecord& next = entry.trace[i];
+            if (next.kind != sim::RequestKind::Read || next.outcome < 0) return false;
+            covered += next.length;
+        }
+        return covered >= place.request->length;
+    }
+
+    // A fault of a cell strikes the first time the cell is programmed in the device's life.
+    bool firstProgramming(const RequestPlace& place) const
+    {
+        const DeviceRecord& entry = device(place.device);
+        for (size_t i = 0; i < place.index; ++i) {
+            const sim::RequestRecord& earlier = entry.trace[i];
+            if (earlier.kind == sim::RequestKind::Write && earlier.wIndex == place.request->wIndex) return false;
+        }
+        return true;
+    }
+
     void blockFault(SweepKind kind, const RequestPlace& place)
     {
-        if (!isBlock(place)) return;
+        if (!isBlock(place) || !firstProgramming(place)) return;
         const sim::RequestRecord& write = *place.request;
         const DeviceRecord& entry = device(place.device);
         uint32_t block = (write.wIndex - entry.layout->firmwareBase) / kBlockSize;
@@ -242,7 +269,7 @@ private:
             FaultRun& run = add(kind, fmt::format("{}, byte {}", where, offset));
             append(deviceFaults(run, place.device), "readCorruptions",
                    Document{{"address", hex16(write.wIndex + offset)}, {"xor", 1}});
-            run.expected = verification;
+            if (readBackComplete(place)) run.expected = verification;
         } else if (kind == SweepKind::stuckBits) {
             // A bit the image sets: after the erase it stays 0 and the block cannot verify.
             for (uint32_t step = 0; step < write.length; ++step) {
@@ -253,27 +280,23 @@ private:
                 FaultRun& run = add(kind, fmt::format("{}, bit mask 0x{:02X} of byte {}", where, mask, offset));
                 append(deviceFaults(run, place.device), "stuckBits",
                        Document{{"address", hex16(write.wIndex + offset)}, {"mask", mask}});
-                run.expected = verification;
+                if (readBackComplete(place)) run.expected = verification;
                 return;
             }
         } else {
             // The first read-back of the block brings half of what was asked for, reported as success:
             // what did not arrive must not pass for the block's bytes.
-            const sim::RequestRecord* readBack = nullptr;
-            uint64_t readNumber = 0;
-            for (size_t i = 0; i < entry.trace.size(); ++i) {
-                if (entry.trace[i].kind != sim::RequestKind::Read) continue;
-                ++readNumber;
-                if (i > place.index) {
-                    readBack = &entry.trace[i];
-                    break;
-                }
-            }
-            if (readBack == nullptr || readBack->length < 2) return;
+            size_t next = place.index + 1;
+            if (next >= entry.trace.size()) return;
+            const sim::RequestRecord* readBack = &entry.trace[next];
+            if (readBack->kind != sim::RequestKind::Read || readBack->outcome < 0 || readBack->length < 2) return;
+            uint64_t readNumber = static_cast<uint64_t>(
+                std::count_if(entry.trace.begin(), entry.trace.begin() + static_cast<std::ptrdiff_t>(next) + 1,
+                              [](const sim::RequestRecord& r) { return r.kind == sim::RequestKind::Read; }));
             FaultRun& run = add(kind, fmt::format("{}, read {} ({})", where, readNumber, requestText(*readBack)));
             append(deviceFaults(run, place.device), "shortReads",
                    Document{{"read", readNumber}, {"bytes", readBack->length / 2}});
-            run.expected = verification;
+            if (readBackComplete(place)) run.expected = verification;
         }
     }
 
@@ -282,6 +305,10 @@ private:
         const sim::RequestRecord& erase = *place.request;
         if (erase.kind != sim::RequestKind::Erase) return;
         const DeviceRecord& entry = device(place.device);
+        // A page's erase is dead over the device's life: its first erase is the place.
+        for (size_t i = 0; i < place.index; ++i) {
+            if (entry.trace[i].kind == sim::RequestKind::Erase && entry.trace[i].wValue == erase.wValue) return;
+        }
         FaultRun& run = add(SweepKind::deadErase, describe(place));
         append(deviceFaults(run, place.device), "deadErases", erase.wValue);
         // On a blank page an erase that does nothing does no harm; elsewhere the read-back must catch it.
@@ -387,6 +414,24 @@ private:
         }
     }
 
+    // The update restarted its device and logged nothing. A change of the
+    // image would otherwise meet the update's own failure first.
+    bool cleanSuccess(const Owner& owner) const
+    {
+        if (owner.device < 0) return false;
+        const DeviceRecord& entry = device(static_cast<size_t>(owner.device));
+        bool restarted = false;
+        for (size_t i = 0; i < entry.trace.size(); ++i) {
+            bool inUpdate = i < entry.updateOf.size() && entry.updateOf[i] == owner.update;
+            if (inUpdate && entry.trace[i].kind == sim::RequestKind::Restart && entry.trace[i].outcome >= 0)
+                restarted = true;
+        }
+        bool logged = std::any_of(clean_.eventLog.begin(), clean_.eventLog.end(), [&](const LogRecord& line) {
+            return line.owner.device == owner.device && line.owner.update == owner.update;
+        });
+        return restarted && !logged;
+    }
+
     // An update's second open is the one it programs from.
     bool isProgrammingOpen(size_t openIndex) const
     {
@@ -453,6 +498,7 @@ private:
             for (int u = 0; u < std::max(entry.updates, 1); ++u) {
                 std::vector<size_t> opens = updateOpens(Owner{static_cast<int>(d), u});
                 if (opens.size() < 2) continue;
+                bool succeeded = cleanSuccess(Owner{static_cast<int>(d), u});
                 const FileOpenSeen& header = clean_.fileOpens[opens.front()];
                 std::string file = withoutObjectPrefix(header.open.dosPath);
                 size_t opensSoFar = 0;
@@ -472,11 +518,12 @@ private:
                     append(objectField(run.scenario, "fileFaults"), "changeContent", change);
                     run.expected.device = static_cast<int>(d);
                     run.expected.update = u;
+                    if (!succeeded) continue;  // its own failure comes first
+                    // Another image of the same size must simply be what the device then holds, which the
+                    // invariants check; one too large must be refused before anything is erased.
                     if (tooLarge) {
                         run.expected.ending = Ending::failsLogged;
                         run.expected.status = kImageRefused;
-                    } else {
-                        run.expected.finalMode = entry.mode;
                     }
                 }
             }

@@ -49,6 +49,7 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
 {
     RequestRecord record;
     record.sequence = ++requests_;
+    record.enumeration = enumerations_;
     record.kind = classify(request.bmRequestType, request.bRequest);
     record.bmRequestType = request.bmRequestType;
     record.bRequest = request.bRequest;

@@ -122,6 +122,7 @@ private:
     EmulatedDeviceOptions options_;
     EnumeratedDevice* current_ = nullptr;
     uint64_t requests_ = 0;
+    uint64_t enumerations_ = 0;  // live enumerations so far
     uint64_t readRequests_ = 0;
     int loaderComebacks_ = 0;
     bool unplugged_ = false;
