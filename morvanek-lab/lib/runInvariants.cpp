@@ -48,8 +48,8 @@ std::vector<UpdateView> viewUpdates(const RunRecord& record, int device)
 class UpdateCheck {
 public:
     UpdateCheck(const DeviceRecord& device, const UpdateView& view, std::vector<InvariantViolation>& out)
-        : device_(device), layout_(*device.layout), view_(view), out_(out), written_(kMemorySize, -1),
-          verified_(kMemorySize, false)
+        : device_(device), layout_(*device.layout), view_(view), out_(out), written_(kMemorySize, 0),
+          state_(kMemorySize, kUnwritten)
     {
     }
 
@@ -123,10 +123,7 @@ private:
                             first, end - 1));
             return;
         }
-        for (uint32_t a = page * kPageSize; a < (page + 1) * kPageSize; ++a) {
-            written_[a] = -1;
-            verified_[a] = false;
-        }
+        std::fill(state_.begin() + page * kPageSize, state_.begin() + (page + 1) * kPageSize, kUnwritten);
     }
 
     void write(const sim::RequestRecord& request)
@@ -153,19 +150,17 @@ private:
             return;
         }
         if (request.data.size() != request.length) return;  // refused before the data stage
-        for (uint32_t i = 0; i < request.length; ++i) {
-            written_[start + i] = request.data[i];
-            verified_[start + i] = false;
-        }
+        std::copy(request.data.begin(), request.data.end(), written_.begin() + start);
+        std::fill(state_.begin() + start, state_.begin() + end, kWritten);
     }
 
     void readBack(const sim::RequestRecord& request)
     {
         for (size_t i = 0; i < request.data.size(); ++i) {
             uint16_t address = static_cast<uint16_t>(request.wIndex + i);
-            if (written_[address] < 0) continue;
+            if (state_[address] == kUnwritten) continue;
             bool equal = request.data[i] == written_[address];
-            verified_[address] = equal;
+            state_[address] = equal ? kVerified : kWritten;
             if (!equal) readBackDiffered_ = true;
         }
         // What a short data stage left out was not read back either.
@@ -184,7 +179,7 @@ private:
         const std::vector<uint8_t>& image = view_.image->open.bytes;
         for (size_t i = 0; i < image.size(); ++i) {
             uint16_t address = static_cast<uint16_t>(layout_.firmwareBase + i);
-            if (written_[address] < 0) {
+            if (state_[address] == kUnwritten) {
                 add("marker before verification",
                     fmt::format("{} writes the completion marker, but image byte {} (0x{:04X}) was never programmed",
                                 describe(request), i, address));
@@ -197,7 +192,7 @@ private:
                                 describe(request), i, address, written_[address], image[i]));
                 return;
             }
-            if (!verified_[address]) {
+            if (state_[address] != kVerified) {
                 add("marker before verification",
                     fmt::format("{} writes the completion marker before block {} was read back equal (0x{:04X})",
                                 describe(request), i / kPageSize, address));
@@ -252,8 +247,10 @@ private:
     const sim::LoaderFlashLayout& layout_;
     const UpdateView& view_;
     std::vector<InvariantViolation>& out_;
-    std::vector<int16_t> written_;  // per address: the byte programmed in this update, -1 for none
-    std::vector<bool> verified_;    // ... and read back equal since
+    // Per address: the byte programmed in this update, and whether it was, and was read back equal since.
+    enum : uint8_t { kUnwritten, kWritten, kVerified };
+    std::vector<uint8_t> written_;
+    std::vector<uint8_t> state_;
     const sim::RequestRecord* firstFailure_ = nullptr;
     bool failedBeforeProgramming_ = false;
     bool programming_ = false;  // the first erase was sent
