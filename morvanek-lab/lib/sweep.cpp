@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstdlib>
 #include <fstream>
 #include <map>
 #include <sstream>
@@ -46,7 +47,8 @@ std::vector<InvariantViolation> checkRun(const ScenarioResult& result, const Fau
 class Sweeper {
 public:
     Sweeper(const std::filesystem::path& path, const SweepOptions& options)
-        : path_(path), folder_(folderOf(path)), options_(options), progress_(stdout)
+        : path_(path), folder_(folderOf(path)), options_(options),
+          progress_(stderr, Progress::styleFor(std::getenv("TERM")))
     {
         runOptions_.modulePath = options.modulePath;
     }
@@ -89,7 +91,7 @@ private:
         }
         for (const FaultRun& run : runs) {
             KindSummary& summary = summaryOf(run.kind);
-            if (options_.progress)
+            if (options_.progress && progress_.due())
                 progress_.show(fmt::format("  sweeping {}: {} {} of {}", path_.filename().string(),
                                            sweepKindName(run.kind), summary.runs + 1, totals[run.kind]));
             faultRun(run, summary);

@@ -21,7 +21,7 @@ namespace lab {
 struct SweepOptions {
     std::string modulePath;  // empty: the module built beside the lab
     std::vector<SweepKind> kinds = allSweepKinds();
-    bool progress = false;  // a progress line on standard output (a terminal)
+    bool progress = false;  // a progress line on standard error (a terminal)
     std::filesystem::path reproducerFolder = "sweep-reproducers";
     size_t reproducersPerKind = 5;
 };

@@ -77,7 +77,8 @@ std::string nowStory(const DeviceRecord& device)
 void printDevice(std::FILE* out, const RunRecord& record, int index, const RunOptions& options)
 {
     const DeviceRecord& device = record.devices[static_cast<size_t>(index)];
-    if (device.layout != nullptr && device.options.vendorId == sim::kDeviceFamilyVendorId) {
+    // The module looks at the low 16 bits of the vendor attribute only.
+    if (device.layout != nullptr && (device.options.vendorId & 0xFFFF) == sim::kDeviceFamilyVendorId) {
         fmt::print(out, "  device {} (loader {:04X}:{:04X})\n", device.name, device.options.vendorId,
                    device.options.loaderProductId);
     } else {
@@ -182,14 +183,6 @@ void printTextReport(std::FILE* out, const ScenarioResult& result, const RunOpti
     fmt::print(out, "FAIL  {}: {} of {} expectation(s) not met\n", result.file, expectations.failures.size(),
                expectations.checked);
     for (const ExpectationFailure& failure : expectations.failures) fmt::print(out, "  {}: {}\n", failure.place, failure.what);
-}
-
-void printSummary(std::FILE* out, const std::vector<ScenarioResult>& results)
-{
-    if (results.size() < 2) return;
-    size_t passed = 0;
-    for (const ScenarioResult& result : results) passed += result.exitCode() == kExitSuccess;
-    fmt::print(out, "\n{} of {} scenario(s) passed\n", passed, results.size());
 }
 
 }  // namespace lab

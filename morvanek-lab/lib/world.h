@@ -20,7 +20,8 @@ namespace lab {
 class World {
 public:
     // Throws LabError when the module cannot be loaded or a folder not made.
-    World(const Scenario& scenario, const std::string& modulePath, Progress* progress);
+    World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
+          const std::string& progressPrefix = {});
     ~World();
     World(const World&) = delete;
     World& operator=(const World&) = delete;
@@ -28,6 +29,7 @@ public:
     sim::ModuleImage& module() { return *module_; }
     RunObserver& observer() { return observer_; }
     sim::PhysicalDevice& device(const std::string& name);
+    const DevicePlan& plan(const std::string& name) const;
     std::vector<std::shared_ptr<sim::PhysicalDevice>>& devices() { return devices_; }
     const std::vector<std::vector<uint8_t>>& flashBefore() const { return flashBefore_; }
 

@@ -142,6 +142,7 @@ tStatus pkgModulePackageEventLog(uint32_t event, const char* firstName, const ch
     entry.secondName = secondName ? secondName : "(null)";
     entry.mainName = mainName ? mainName : "(null)";
     entry.moduleMain = moduleMain;
+    entry.liveBlocks = Host::get().allocator.liveBlocks();
     Host::get().packageEvents.push_back(entry);
     return 0;
 }

@@ -41,6 +41,7 @@ struct PackageEvent {
     std::string secondName;
     std::string mainName;
     tModuleMain moduleMain = nullptr;
+    size_t liveBlocks = 0;  // host allocations live when the event came, which shows what ran before it
 };
 
 // Counts live blocks; can be told to fail the Nth allocation from now on, or all.
@@ -118,7 +119,9 @@ public:
     // deliverPendingEvents(), never from inside the call that caused them.
     void queueArrival(UsbDeviceSim& device);
     void queueRemoval(UsbDeviceSim& device);
-    void adopt(std::unique_ptr<UsbDeviceSim> device);  // kept alive, not yet present
+    // Kept alive, not yet present; placed in the search order right after
+    // `after` (an earlier enumeration of the same device) when given.
+    void adopt(std::unique_ptr<UsbDeviceSim> device, const UsbDeviceSim* after = nullptr);
     void deliverPendingEvents();
 
     std::vector<UsbDeviceSim*> presentDevices() const;
@@ -128,6 +131,9 @@ public:
     int createQueryCalls() const { return createQueryCalls_; }
     int setAttributeCalls() const { return setAttributeCalls_; }
     int findDevicesCalls() const { return findDevicesCalls_; }
+    // The records now registered, in the order they were added.
+    const std::vector<ListenerRecord*>& listenerRecords() const { return listeners_; }
+    int queryIdReads() const { return queryIdReads_; }
     int addListenerCalls() const { return addListenerCalls_; }
     int removeListenerCalls() const { return removeListenerCalls_; }
     std::vector<std::string> describeLeftovers() const;
@@ -148,6 +154,7 @@ private:
     int createQueryCalls_ = 0;
     int setAttributeCalls_ = 0;
     int findDevicesCalls_ = 0;
+    int queryIdReads_ = 0;
     int addListenerCalls_ = 0;
     int removeListenerCalls_ = 0;
     bool delivering_ = false;

@@ -48,8 +48,11 @@ std::string createKeyArgumentProblem(HANDLE* keyHandle, const OBJECT_ATTRIBUTES*
     if (attributes->ObjectName == nullptr) return "no object name";
     std::string nameProblem = countedStringProblem(*attributes->ObjectName, "the object name");
     if (!nameProblem.empty()) return nameProblem;
-    if (attributes->Attributes != kObjCaseInsensitive)
-        return "object attributes " + hexNumber(attributes->Attributes) + ", not OBJ_CASE_INSENSITIVE (0x40)";
+    // A handle without OBJ_KERNEL_HANDLE belongs to whatever process the
+    // calling thread runs in, where user mode can reach it.
+    if (attributes->Attributes != (kObjCaseInsensitive | kObjKernelHandle))
+        return "object attributes " + hexNumber(attributes->Attributes) +
+               ", not OBJ_CASE_INSENSITIVE | OBJ_KERNEL_HANDLE (0x240)";
     if (attributes->SecurityDescriptor != nullptr) return "a security descriptor was given";
     if (attributes->SecurityQualityOfService != nullptr) return "a security quality of service was given";
     if (keyClass != nullptr) return "a key class was given";

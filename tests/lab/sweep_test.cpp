@@ -3,6 +3,7 @@
 // the command catches a deliberately broken build of the module (one that
 // takes every block as verified) and writes a scenario that reproduces it.
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
@@ -246,7 +247,9 @@ TEST(FaultExpectation, CatchesAnEndingTheFaultDoesNotCallFor)
 
 std::string freshFolder(const std::string& name)
 {
-    std::filesystem::path folder = std::filesystem::path(testing::TempDir()) / name;
+    // Runs of this program side by side (and of other builds) each get their own.
+    std::filesystem::path folder =
+        std::filesystem::path(testing::TempDir()) / (name + "-" + std::to_string(::getpid()));
     std::filesystem::remove_all(folder);
     return folder.string();
 }

@@ -39,7 +39,9 @@ TEST_P(Failures, LeaveTheDeviceInLoaderModeAndReportOnlyTheirOwnMessages)
     if (c.world) c.world(image);
 
     sim::LoaderModeDevice& loader =
-        run(hardware, arrival, [&](sim::LoaderModeDevice& device) { device.failDescriptor = c.descriptorFails; });
+        run(hardware, arrival, [fails = c.descriptorFails](sim::LoaderModeDevice& device) {
+            device.failDescriptor = fails;
+        });
 
     EXPECT_EQ(requestLines(*hardware), c.requests);
     EXPECT_EQ(logLines(), c.log);
