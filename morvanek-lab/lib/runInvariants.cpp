@@ -259,24 +259,31 @@ private:
     bool readBackDiffered_ = false;  // a read-back differed from what was written, or came short
 };
 
-// A device that runs its firmware holds, from the firmware base, the image of
-// the update that restarted it, with the marker over bytes 6 and 7.
+// A device that runs its firmware after an update marked it complete holds,
+// from the firmware base, that update's image with the marker over bytes 6
+// and 7. (A device may also start in firmware it had before the run.)
 void checkFirmwareRunning(const DeviceRecord& device, const std::vector<UpdateView>& views,
                           std::vector<InvariantViolation>& out)
 {
     if (device.mode != "product") return;
-    const UpdateView* restarting = nullptr;
+    const UpdateView* programming = nullptr;
+    bool marked = false;
+    const uint16_t marker = static_cast<uint16_t>(device.layout->firmwareBase + kMarkerOffset);
     for (const UpdateView& view : views) {
+        bool erased = false;
+        bool wroteMarker = false;
         for (size_t index : view.requests) {
-            if (device.trace[index].kind == sim::RequestKind::Restart) restarting = &view;
+            const sim::RequestRecord& request = device.trace[index];
+            if (request.kind == sim::RequestKind::Erase) erased = true;
+            if (erased && request.kind == sim::RequestKind::Write && request.wIndex == marker && request.length == 2)
+                wroteMarker = true;
         }
+        if (!erased) continue;
+        programming = &view;
+        marked = wroteMarker;
     }
-    if (restarting == nullptr) {
-        out.push_back({"firmware not as programmed", device.name, "it runs its firmware, but no update restarted it"});
-        return;
-    }
-    if (restarting->image == nullptr) return;  // the marker check has said so already
-    std::vector<uint8_t> expected = restarting->image->open.bytes;
+    if (programming == nullptr || !marked || programming->image == nullptr) return;
+    std::vector<uint8_t> expected = programming->image->open.bytes;
     if (expected.size() > kMarkerOffset + 1) {
         expected[kMarkerOffset] = 0xAA;
         expected[kMarkerOffset + 1] = 0x55;
@@ -287,7 +294,7 @@ void checkFirmwareRunning(const DeviceRecord& device, const std::vector<UpdateVi
         out.push_back({"firmware not as programmed", device.name,
                        fmt::format("it runs its firmware, but 0x{:04X} holds 0x{:02X} where the image of update {} "
                                    "(with the marker) has 0x{:02X}",
-                                   address, device.flashAfter[address], restarting->index + 1, expected[i])});
+                                   address, device.flashAfter[address], programming->index + 1, expected[i])});
         return;
     }
 }
