@@ -22,6 +22,7 @@
 #include "lib/pictures.h"
 #include "lib/reports.h"
 #include "lib/scenarioError.h"
+#include "lib/sweep.h"
 #include "source/versionServices.h"
 
 namespace {
@@ -30,7 +31,7 @@ constexpr const char* kExitCodes =
     "Exit codes: 0 success, 1 an expectation failed, 2 a scenario (or the command line) is invalid, "
     "3 the lab itself failed (for example, the module cannot be loaded).";
 
-const char* const kCommands[] = {"run", "demo", "inspect"};
+const char* const kCommands[] = {"run", "demo", "sweep", "inspect"};
 const char* const kInspectCommands[] = {"image", "identity"};
 
 struct CommonOptions {
@@ -144,6 +145,38 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     return lab::combinedExitCode(results);
 }
 
+struct SweepCommand {
+    std::string file;
+    std::string faults = "all";
+    std::string reproducers = "sweep-reproducers";
+};
+
+int sweepScenario(const SweepCommand& command, const CommonOptions& common)
+{
+    lab::SweepKindChoice choice = lab::chooseSweepKinds(command.faults);
+    if (!choice.unknown.empty()) {
+        std::vector<std::string> names;
+        for (lab::SweepKind kind : lab::allSweepKinds()) names.push_back(lab::sweepKindName(kind));
+        throw lab::CommandError(lab::kExitScenarioInvalid,
+                                fmt::format("--faults: \"{}\" is not a kind of fault; the kinds are {}, or all or none",
+                                            choice.unknown, fmt::join(names, ", ")));
+    }
+    lab::SweepOptions options;
+    options.modulePath = common.modulePath;
+    options.kinds = choice.kinds;
+    options.progress = progressWanted(common);
+    options.reproducerFolder = command.reproducers;
+    lab::SweepResult result = lab::sweepScenarioFile(command.file, options);
+    if (common.json) {
+        std::cout << lab::sweepJsonReport(result).dump(2, ' ', false, nlohmann::json::error_handler_t::replace) << "\n";
+        if (!result.invalid.empty()) fmt::print(stderr, "morvanek-lab: invalid scenario: {}\n", result.invalid);
+        if (!result.labError.empty()) fmt::print(stderr, "morvanek-lab: {}: {}\n", result.file, result.labError);
+    } else {
+        lab::printSweepReport(stdout, result);
+    }
+    return result.exitCode();
+}
+
 // The first word that is not an option names the command; CLI11 would call a
 // mistyped one an unexpected argument, which does not help.
 std::string unknownCommand(int argc, char** argv)
@@ -158,7 +191,7 @@ std::string unknownCommand(int argc, char** argv)
         return false;
     };
     if (!known(argv[at], kCommands)) {
-        return fmt::format("unknown command \"{}\"; the commands are run, demo and inspect (morvanek-lab --help)",
+        return fmt::format("unknown command \"{}\"; the commands are run, demo, sweep and inspect (morvanek-lab --help)",
                            argv[at]);
     }
     if (std::strcmp(argv[at], "inspect") != 0) return {};
@@ -216,6 +249,19 @@ int main(int argc, char** argv)
     CLI::App* demo = app.add_subcommand("demo", "run the bundled demonstration: two devices, one on each loader");
     addCommonOptions(*demo, common);
 
+    SweepCommand sweepCommand;
+    CLI::App* sweep = app.add_subcommand(
+        "sweep", "run a scenario once clean, then once per place a fault can strike, and check every run against what "
+                 "the loader promises");
+    sweep->add_option("scenario", sweepCommand.file, "the scenario file (JSON)")->required();
+    sweep->add_option("--faults", sweepCommand.faults,
+                      "kinds of fault, separated by commas; \"all\" (the default) or \"none\" (the clean run only)");
+    sweep->add_option("--reproducers", sweepCommand.reproducers,
+                      "where the scenarios that reproduce violations are written (default: sweep-reproducers)");
+    sweep->add_flag("--json", common.json, "write one machine-readable report, and nothing else, on standard output");
+    sweep->add_flag("--no-progress", common.noProgress, "no progress line, even on a terminal");
+    sweep->add_option("--module", common.modulePath, "the module to load (default: the one built beside the lab)");
+
     lab::InspectOptions inspect;
     CLI::App* inspectCommand = app.add_subcommand("inspect", "decode an image file or an identity block");
     inspectCommand->require_subcommand(1);
@@ -249,6 +295,7 @@ int main(int argc, char** argv)
     try {
         if (run->parsed()) return runScenarios(files, common);
         if (demo->parsed()) return runScenarios({MORVANEK_LAB_DEMO_SCENARIO}, common);
+        if (sweep->parsed()) return sweepScenario(sweepCommand, common);
         if (image->parsed()) return lab::inspectImage(inspect, stdout);
         if (identity->parsed()) return lab::inspectIdentity(inspect, stdout);
     } catch (const lab::CommandError& error) {

@@ -50,7 +50,8 @@ sim::RequestKind requestKind(const JsonNode& node)
 sim::DeviceFaults parseFaults(const JsonNode& node)
 {
     node.allowOnly({"stallRequests", "stallKinds", "readCorruptions", "shortReads", "unplugAtRequest",
-                    "refuseOpenStream", "refuseAllocateBuffer", "failAttributes", "failGetDescriptor"});
+                    "refuseOpenStream", "refuseAllocateBuffer", "failAttributes", "failGetDescriptor", "lostStatus",
+                    "stuckBits", "deadErases", "failTransferBuffer", "failFreeBuffer", "failCloseStream"});
     sim::DeviceFaults faults;
     if (auto list = node.optionalField("failAttributes")) {
         for (const JsonNode& item : list->itemsOrOne()) {
@@ -64,13 +65,30 @@ sim::DeviceFaults parseFaults(const JsonNode& node)
         }
     }
     if (auto status = node.optionalField("failGetDescriptor")) faults.descriptorFailure = failureStatus(*status);
-    if (auto list = node.optionalField("stallRequests")) {
+    auto numbers = [&](const char* name, const char* counted, std::set<uint64_t>& into) {
+        if (auto list = node.optionalField(name)) {
+            for (const JsonNode& item : list->itemsOrOne()) {
+                uint64_t number = item.unsignedNumber(1000000000);
+                if (number == 0) item.fail(fmt::format("{} count from 1", counted));
+                into.insert(number);
+            }
+        }
+    };
+    numbers("stallRequests", "requests", faults.stallRequests);
+    numbers("lostStatus", "requests", faults.lostStatus);
+    numbers("failTransferBuffer", "transfer buffers", faults.failTransferBuffers);
+    if (auto list = node.optionalField("stuckBits")) {
         for (const JsonNode& item : list->itemsOrOne()) {
-            uint64_t number = item.unsignedNumber(1000000000);
-            if (number == 0) item.fail("requests count from 1");
-            faults.stallRequests.insert(number);
+            item.allowOnly({"address", "mask"});
+            faults.stuckBits.push_back({id16(item.field("address")), static_cast<uint8_t>(item.field("mask").unsignedNumber(0xFF))});
         }
     }
+    if (auto list = node.optionalField("deadErases")) {
+        for (const JsonNode& item : list->itemsOrOne())
+            faults.deadErases.insert(static_cast<uint16_t>(item.unsignedNumber(sim::FlashMemory::kPages - 1)));
+    }
+    if (auto status = node.optionalField("failFreeBuffer")) faults.failFreeBuffer = failureStatus(*status);
+    if (auto status = node.optionalField("failCloseStream")) faults.failCloseStream = failureStatus(*status);
     if (auto list = node.optionalField("stallKinds")) {
         for (const JsonNode& item : list->itemsOrOne()) faults.stallKinds.insert(requestKind(item));
     }

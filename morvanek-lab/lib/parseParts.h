@@ -12,7 +12,7 @@ namespace lab {
 HostPlan parseHost(const JsonNode& node);
 RegistryPlan parseRegistry(const JsonNode& node, const std::filesystem::path& directory);
 std::vector<DrivePlan> parseDrives(const JsonNode& node, const std::filesystem::path& directory);
-FileFaultPlan parseFileFaults(const JsonNode& node);
+FileFaultPlan parseFileFaults(const JsonNode& node, const std::filesystem::path& directory);
 std::vector<DevicePlan> parseDevices(const JsonNode& node, const std::filesystem::path& directory);
 std::vector<StepPlan> parseSteps(const JsonNode& node, const std::vector<DevicePlan>& devices);
 Expectations parseExpectations(const JsonNode& node, const std::vector<DevicePlan>& devices);

@@ -141,11 +141,10 @@ GeneratedImagePlan parseGenerated(const JsonNode& node)
     return plan;
 }
 
-FilePlan parseFile(const std::string& name, const JsonNode& node, const std::filesystem::path& directory)
+// A file's bytes, given as exactly one of "hex", "text", "generate" and "copyOf".
+std::vector<uint8_t> fileContent(const JsonNode& node, const std::filesystem::path& directory)
 {
     FilePlan file;
-    file.path = driveRelativePath(node, name);
-    node.allowOnly({"hex", "text", "generate", "copyOf", "heldOpenElsewhere"});
     int sources = 0;
     if (auto hex = node.optionalField("hex")) {
         file.bytes = hex->hexBytes();
@@ -165,8 +164,31 @@ FilePlan parseFile(const std::string& name, const JsonNode& node, const std::fil
         ++sources;
     }
     if (sources != 1) node.fail("give the file's content as exactly one of \"hex\", \"text\", \"generate\" and \"copyOf\"");
+    return file.bytes;
+}
+
+FilePlan parseFile(const std::string& name, const JsonNode& node, const std::filesystem::path& directory)
+{
+    FilePlan file;
+    file.path = driveRelativePath(node, name);
+    node.allowOnly({"hex", "text", "generate", "copyOf", "heldOpenElsewhere"});
+    file.bytes = fileContent(node, directory);
     if (auto held = node.optionalField("heldOpenElsewhere")) file.heldOpenElsewhere = held->flag();
     return file;
+}
+
+ContentChangePlan parseContentChange(const JsonNode& node, const std::filesystem::path& directory)
+{
+    node.allowOnly({"file", "afterOpens", "hex", "text", "generate", "copyOf"});
+    ContentChangePlan change;
+    change.pointer = node.pointer();
+    change.dosPath = dosFilePath(node.field("file"));
+    if (auto opens = node.optionalField("afterOpens")) {
+        change.afterOpens = static_cast<unsigned>(opens->unsignedNumber(1000000));
+        if (change.afterOpens == 0) opens->fail("a file that changes before its first open is just another file");
+    }
+    change.bytes = fileContent(node, directory);
+    return change;
 }
 
 }  // namespace
@@ -281,11 +303,15 @@ RegistryPlan parseRegistry(const JsonNode& node, const std::filesystem::path& di
     }
     if (auto faults = node.optionalField("faults")) {
         for (const JsonNode& item : faults->items()) {
-            item.allowOnly({"key", "value", "status"});
+            item.allowOnly({"key", "value", "status", "number"});
             RegistryFaultPlan fault;
             fault.keyPath = kernelKeyPath(item.field("key"));
             if (auto value = item.optionalField("value")) fault.valueName = value->text();
-            fault.status = item.field("status").status();
+            fault.status = failureStatus(item.field("status"));
+            if (auto number = item.optionalField("number")) {
+                fault.number = number->unsignedNumber(1000000);
+                if (fault.number == 0) number->fail("calls count from 1");
+            }
             registry.faults.push_back(fault);
         }
     }
@@ -335,9 +361,10 @@ std::string dosFilePath(const JsonNode& node)
     return letter + ":\\" + driveRelativePath(node, path.substr(3));
 }
 
-FileFaultPlan parseFileFaults(const JsonNode& node)
+FileFaultPlan parseFileFaults(const JsonNode& node, const std::filesystem::path& directory)
 {
-    node.allowOnly({"failReads", "failRead", "failSizeQuery", "failSetPosition", "failOpen"});
+    node.allowOnly({"failReads", "failRead", "failSizeQuery", "failSetPosition", "failOpen", "shortReads",
+                    "changeContent"});
     FileFaultPlan faults;
     if (auto status = node.optionalField("failReads")) faults.everyRead = failureStatus(*status);
     if (auto reads = node.optionalField("failRead")) {
@@ -359,6 +386,18 @@ FileFaultPlan parseFileFaults(const JsonNode& node)
     }
     if (auto status = node.optionalField("failSetPosition")) faults.setPosition = failureStatus(*status);
     if (auto failures = node.optionalField("failOpen")) faults.opens = parseCallFailures(*failures, true);
+    if (auto reads = node.optionalField("shortReads")) {
+        for (const JsonNode& item : reads->itemsOrOne()) {
+            item.allowOnly({"number", "bytes"});
+            uint64_t number = item.field("number").unsignedNumber(1000000);
+            if (number == 0) item.field("number").fail("reads count from 1");
+            faults.shortReads.emplace_back(static_cast<unsigned>(number),
+                                           static_cast<uint32_t>(item.field("bytes").unsignedNumber(0xFFFFFFFF)));
+        }
+    }
+    if (auto changes = node.optionalField("changeContent")) {
+        for (const JsonNode& item : changes->itemsOrOne()) faults.contentChanges.push_back(parseContentChange(item, directory));
+    }
     return faults;
 }
 

@@ -36,6 +36,7 @@ void RunObserver::catchUp()
 void RunObserver::stepBegins()
 {
     catchUp();
+    ++step_;
     last_ = Owner{};
 }
 
@@ -50,13 +51,15 @@ void RunObserver::onRequest(int index, const sim::PhysicalDevice& device, const 
 {
     catchUp();
     Watched& watched = devices_[static_cast<size_t>(index)];
-    const sim::EnumeratedDevice* enumeration = device.current();
-    if (enumeration != nullptr && enumeration != watched.enumeration) {
-        watched.enumeration = enumeration;
+    // By the enumeration the request came through: a device unplugged at a
+    // request has none by the time it is observed.
+    if (record.enumeration != watched.enumeration) {
+        watched.enumeration = record.enumeration;
         ++watched.updates;
     }
     int update = std::max(watched.updates - 1, 0);
     watched.updateOf.push_back(update);
+    watched.stepOf.push_back(step_);
     requestOrder_.push_back(index);
     last_ = Owner{index, update};
 

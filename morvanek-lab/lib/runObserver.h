@@ -28,6 +28,7 @@ public:
     const std::vector<Owner>& openOwners() const { return openOwners_; }
     const std::vector<Owner>& registryOwners() const { return registryOwners_; }
     const std::vector<int>& updateOf(int device) const { return devices_.at(device).updateOf; }
+    const std::vector<int>& stepOf(int device) const { return devices_.at(device).stepOf; }
     int updates(int device) const { return devices_.at(device).updates; }
     const std::vector<int>& requestOrder() const { return requestOrder_; }
     const std::vector<WriteNotTaken>& writesNotTaken(int device) const { return devices_.at(device).writesNotTaken; }
@@ -47,9 +48,10 @@ private:
     struct Watched {
         std::string name;
         UpdateProgress progress;
-        const sim::EnumeratedDevice* enumeration = nullptr;
+        uint64_t enumeration = 0;  // of the last request seen
         int updates = 0;
         std::vector<int> updateOf;
+        std::vector<int> stepOf;
         std::vector<WriteNotTaken> writesNotTaken;
     };
 
@@ -64,6 +66,7 @@ private:
     std::string prefix_;
     std::vector<Watched> devices_;
     Owner last_;
+    int step_ = -1;
     std::vector<Owner> logOwners_;
     std::vector<Owner> openOwners_;
     std::vector<Owner> registryOwners_;

@@ -64,6 +64,7 @@ struct DeviceRecord {
     std::vector<uint8_t> flashAfter;
     std::vector<sim::RequestRecord> trace;
     std::vector<int> updateOf;  // per trace entry: the update (enumeration in loader mode) it belongs to
+    std::vector<int> stepOf;    // per trace entry: the step (from 0) during which it came
     int updates = 0;
     std::vector<WriteNotTaken> writesNotTaken;
     std::string mode;  // "loader", "product", "unplugged"
@@ -90,6 +91,9 @@ struct RunRecord {
     std::vector<Owner> registryCallOwners;  // beside registryCalls
     std::vector<std::string> createdKeys;
     std::vector<sim::kernel::RegistryCall> registryCalls;
+    std::vector<sim::kernel::FileReadRecord> fileReads;
+    std::vector<sim::kernel::FileInformationRecord> fileInformationCalls;
+    std::vector<std::string> allocationAttempts;  // during the steps, in order, by purpose
     std::vector<std::string> leftovers;
     std::vector<std::string> misuse;
     size_t liveBlocks = 0;

@@ -187,6 +187,11 @@ RunRecord takeRecord(const Scenario& scenario, World& world, std::vector<StepRec
     record.requestOrder = observer.requestOrder();
     record.createdKeys = sim::kernel::registry().createdKeys();
     record.registryCalls = sim::kernel::registry().calls();
+    record.fileReads = sim::kernel::files().reads();
+    record.fileInformationCalls = sim::kernel::files().informationCalls();
+    const std::vector<std::string>& attempts = host.allocator.attempts();
+    size_t before = std::min(world.allocationAttemptsBeforeSteps(), attempts.size());
+    record.allocationAttempts.assign(attempts.begin() + static_cast<std::ptrdiff_t>(before), attempts.end());
     for (size_t i = 0; i < record.registryCalls.size(); ++i)
         record.registryCallOwners.push_back(i < observer.registryOwners().size() ? observer.registryOwners()[i] : Owner{});
 
@@ -202,6 +207,7 @@ RunRecord takeRecord(const Scenario& scenario, World& world, std::vector<StepRec
         entry.flashAfter = device.readMemory(0, sim::FlashMemory::kSize);
         entry.trace = device.trace;
         entry.updateOf = observer.updateOf(static_cast<int>(i));
+        entry.stepOf = observer.stepOf(static_cast<int>(i));
         entry.updates = observer.updates(static_cast<int>(i));
         entry.writesNotTaken = observer.writesNotTaken(static_cast<int>(i));
         entry.mode = modeOf(device);

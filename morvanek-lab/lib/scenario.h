@@ -50,6 +50,7 @@ struct RegistryFaultPlan {
     std::string keyPath;
     std::optional<std::string> valueName;  // set: the query of that value fails; unset: opening the key fails
     int32_t status = 0;
+    uint64_t number = 0;  // 0: every call; N: the Nth call of that key or value only
 };
 
 struct RegistryPlan {
@@ -70,6 +71,14 @@ struct DrivePlan {
     std::vector<FilePlan> files;                  // written to a fresh temporary folder
 };
 
+// A file replaced by other bytes once it has been opened a number of times.
+struct ContentChangePlan {
+    std::string pointer;
+    std::string dosPath;  // "C:\WINDOWS\..."
+    unsigned afterOpens = 1;
+    std::vector<uint8_t> bytes;
+};
+
 struct FileFaultPlan {
     int32_t everyRead = 0;
     std::vector<std::pair<unsigned, int32_t>> readNumbers;
@@ -77,6 +86,8 @@ struct FileFaultPlan {
     int32_t setPosition = 0;
     std::vector<CallFailurePlan> opens;
     std::vector<CallFailurePlan> sizeQueries;
+    std::vector<std::pair<unsigned, uint32_t>> shortReads;  // read number, bytes it brings
+    std::vector<ContentChangePlan> contentChanges;
 };
 
 struct DevicePlan {

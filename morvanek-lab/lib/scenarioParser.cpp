@@ -40,7 +40,7 @@ Scenario parseScenarioText(const std::string& text, const std::string& fileName,
     if (auto node = root.optionalField("host")) scenario.host = parseHost(*node);
     if (auto node = root.optionalField("registry")) scenario.registry = parseRegistry(*node, directory);
     if (auto node = root.optionalField("drives")) scenario.drives = parseDrives(*node, directory);
-    if (auto node = root.optionalField("fileFaults")) scenario.fileFaults = parseFileFaults(*node);
+    if (auto node = root.optionalField("fileFaults")) scenario.fileFaults = parseFileFaults(*node, directory);
     if (auto node = root.optionalField("devices")) scenario.devices = parseDevices(*node, directory);
     if (auto node = root.optionalField("steps")) {
         scenario.steps = parseSteps(*node, scenario.devices);

@@ -142,6 +142,12 @@ void World::buildDrives()
     for (const auto& [number, status] : faults.readNumbers) files.failReadNumber(number, status);
     if (faults.sizeQuery != 0) files.failSizeQuery(faults.sizeQuery);
     if (faults.setPosition != 0) files.failSetPosition(faults.setPosition);
+    for (const auto& [number, bytes] : faults.shortReads) files.shortenRead(number, bytes);
+    for (const ContentChangePlan& change : faults.contentChanges) {
+        std::optional<std::filesystem::path> file = hostPath(change.dosPath);
+        if (!file) throw ScenarioError(scenario_.file, change.pointer + "/file", "no such file on the scenario's drives");
+        files.changeContentAfterOpens(*file, change.afterOpens, change.bytes);
+    }
     for (const CallFailurePlan& failure : faults.opens)
         files.failOpenNumber(static_cast<unsigned>(failure.number), failure.status, faultFile(failure));
     for (const CallFailurePlan& failure : faults.sizeQueries)
@@ -169,9 +175,9 @@ void World::buildRegistry()
     }
     for (const RegistryFaultPlan& fault : scenario_.registry.faults) {
         if (fault.valueName) {
-            registry.failQuery(fault.keyPath, *fault.valueName, fault.status);
+            registry.failQuery(fault.keyPath, *fault.valueName, fault.status, fault.number);
         } else {
-            registry.failCreateKey(fault.keyPath, fault.status);
+            registry.failCreateKey(fault.keyPath, fault.status, fault.number);
         }
     }
 }
@@ -203,6 +209,7 @@ std::vector<std::string> World::engineLeftovers()
 void World::armAllocationFaults()
 {
     sim::Allocator& allocator = sim::Host::get().allocator;
+    attemptsBeforeSteps_ = allocator.attempts().size();
     for (size_t nth : scenario_.host.failAllocations) allocator.failNth(nth);
     allocator.failAll(scenario_.host.failAllAllocations);
 }

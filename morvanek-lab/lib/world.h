@@ -47,6 +47,8 @@ public:
 
     // Applied last, just before the steps, so that they count the steps' allocations only.
     void armAllocationFaults();
+    // Allocation attempts before the steps began, which the faults do not count.
+    size_t allocationAttemptsBeforeSteps() const { return attemptsBeforeSteps_; }
 
 private:
     void buildDrives();
@@ -63,6 +65,7 @@ private:
     std::vector<std::vector<uint8_t>> flashBefore_;
     std::unique_ptr<sim::ModuleImage> module_;
     WindowsModule* windows_ = nullptr;  // module_, when it is the Windows engine's
+    size_t attemptsBeforeSteps_ = 0;
 };
 
 }  // namespace lab

@@ -20,6 +20,13 @@ struct ReadCorruption {
     std::optional<uint8_t> replacement;  // when set, read back instead of the stored byte
 };
 
+// Bits of a flash cell that do not take: a write leaves them as they were, an
+// erase leaves them 0.
+struct StuckBits {
+    uint16_t address = 0;
+    uint8_t mask = 0;
+};
+
 // A read whose IN data stage ends early, as a flaky bus or a worn-out loader
 // can make it, while the transfer still reports success: only the first
 // `bytes` bytes reach the host's buffer, the rest of it stays as it was.
@@ -46,6 +53,17 @@ struct DeviceFaults {
     uint64_t unplugAtRequest = 0;
     bool refuseOpenStream = false;
     bool refuseAllocateBuffer = false;
+    // Requests that take effect (a write programs, an erase erases, a restart
+    // restarts) but whose status stage is lost, so that the host reports failure.
+    std::set<uint64_t> lostStatus;
+    std::vector<StuckBits> stuckBits;
+    // Pages whose erase reports success and leaves the page as it was.
+    std::set<uint16_t> deadErases;
+    // The device's allocateBuffer calls (from 1, over its life) whose host allocation fails.
+    std::set<uint64_t> failTransferBuffers;
+    // Negative: freeBuffer and closeStream report it, though the release still happens.
+    int32_t failFreeBuffer = 0;
+    int32_t failCloseStream = 0;
 };
 
 }  // namespace sim

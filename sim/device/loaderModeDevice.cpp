@@ -23,11 +23,14 @@ public:
             setFailure(status, kHostDeviceGone);
             return nullptr;
         }
-        if (device_.hardware().faults.refuseAllocateBuffer) {
+        PhysicalDevice& hardware = device_.hardware();
+        uint64_t request = ++hardware.transferBufferRequests;
+        if (hardware.faults.refuseAllocateBuffer || hardware.faults.failTransferBuffers.count(request) != 0) {
             setFailure(status, kHostAllocationFailed);
             return nullptr;
         }
-        void* buffer = Host::get().allocator.allocate(size, &status);
+        std::string purpose = "the transfer buffer of " + hardware.options().name;
+        void* buffer = Host::get().allocator.allocate(size, &status, purpose.c_str());
         if (buffer != nullptr) buffers_[static_cast<const uint8_t*>(buffer)] = size;
         return buffer;
     }
@@ -46,6 +49,8 @@ public:
         }
         buffers_.erase(it);
         Host::get().allocator.release(buffer);
+        // A host that reports a failed release has still released: nothing may leak.
+        if (device_.hardware().faults.failFreeBuffer < 0) setFailure(status, device_.hardware().faults.failFreeBuffer);
     }
 
     void transfer(nQVKORD100::tTransferParameterUSBControl* request, tStatus& status) override
@@ -131,6 +136,7 @@ void LoaderModeDevice::closeStream(ControlStream* stream, tStatus& status)
         return;
     }
     known->open = false;
+    if (hardware_->faults.failCloseStream < 0) setFailure(status, hardware_->faults.failCloseStream);
 }
 
 size_t LoaderModeDevice::openStreams() const

@@ -49,6 +49,7 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
 {
     RequestRecord record;
     record.sequence = ++requests_;
+    record.enumeration = enumerations_;
     record.kind = classify(request.bmRequestType, request.bRequest);
     record.bmRequestType = request.bmRequestType;
     record.bRequest = request.bRequest;
@@ -71,9 +72,14 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
     bool stallInjected = faults.stallRequests.count(record.sequence) != 0 || faults.stallKinds.count(record.kind) != 0;
     if (reachedDevice && stallInjected) outcome = kHostTransferStalled;
     if (outcome >= 0) outcome = carryOut(request, record);
+    bool tookEffect = outcome >= 0;
+    if (tookEffect && faults.lostStatus.count(record.sequence) != 0) {
+        notes.push_back("request " + std::to_string(record.sequence) + " took effect, but its status stage was lost");
+        outcome = kHostTransferStalled;
+    }
 
     if (timing && reachedDevice) {
-        bool done = outcome >= 0;
+        bool done = tookEffect;
         uint32_t length = done ? record.length : 0;
         bool erased = done && record.kind == RequestKind::Erase;
         uint32_t programmed = done && record.kind == RequestKind::Write ? record.length : 0;
@@ -85,7 +91,7 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
     if (requestObserver) requestObserver(*this, record);
     if (traceEnabled) trace.push_back(std::move(record));
 
-    if (outcome >= 0 && kind == RequestKind::Restart) leaveLoaderMode();
+    if (tookEffect && kind == RequestKind::Restart) leaveLoaderMode();
     return outcome;
 }
 
@@ -108,12 +114,25 @@ tStatus PhysicalDevice::carryOut(nQVKORD100::tTransferParameterUSBControl& reque
         if (traceEnabled) record.data = std::move(bytes);
         break;
     }
-    case RequestKind::Write:
-        flash.program(request.wIndex, data, request.length);
+    case RequestKind::Write: {
+        // Stuck bits keep their value: programming them with 1 leaves them as they are.
+        std::vector<uint8_t> programmed(data, data + request.length);
+        for (const StuckBits& stuck : faults.stuckBits) {
+            uint16_t offset = static_cast<uint16_t>(stuck.address - request.wIndex);
+            if (offset < request.length) programmed[offset] |= stuck.mask;
+        }
+        flash.program(request.wIndex, programmed.data(), programmed.size());
         if (traceEnabled) record.data.assign(data, data + request.length);
         break;
+    }
     case RequestKind::Erase:
+        if (faults.deadErases.count(request.wValue) != 0) break;
         flash.erasePage(request.wValue);
+        for (const StuckBits& stuck : faults.stuckBits) {
+            if (stuck.address / FlashMemory::kPageSize != request.wValue) continue;
+            std::vector<uint8_t> cleared{static_cast<uint8_t>(flash.at(stuck.address) & ~stuck.mask)};
+            flash.load(stuck.address, cleared);
+        }
         break;
     case RequestKind::Restart:
     case RequestKind::Unknown:

@@ -104,6 +104,7 @@ void PhysicalDevice::attach(EnumeratedDevice& enumeration)
 {
     if (current_ == nullptr) {
         current_ = &enumeration;
+        ++enumerations_;
     } else {
         enumeration.markGone();
     }

@@ -77,6 +77,7 @@ public:
     std::vector<RequestRecord> trace;
     std::chrono::microseconds elapsed{0};  // virtual time spent on requests
     std::vector<std::string> notes;         // what the lab may want to show; not errors
+    uint64_t transferBufferRequests = 0;    // allocateBuffer calls on its streams, over its life
     // Called after each request has been carried out (or refused), before it
     // goes to the trace and before a restart re-enumerates the device; the
     // flash already shows the request's effect. For observers such as the lab.
@@ -139,6 +140,7 @@ private:
     const UsbDeviceSim* lastEnumeration_ = nullptr;  // where the next enumeration takes its place; never read through
     bool unplugFired_ = false;
     uint64_t requests_ = 0;
+    uint64_t enumerations_ = 0;  // live enumerations so far
     uint64_t readRequests_ = 0;
     int loaderComebacks_ = 0;
     bool unplugged_ = false;

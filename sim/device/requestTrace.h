@@ -13,6 +13,7 @@ namespace sim {
 
 struct RequestRecord {
     uint64_t sequence = 0;  // from 1, over the device's whole life
+    uint64_t enumeration = 0;  // which of the device's enumerations it came through, from 1
     RequestKind kind = RequestKind::Unknown;
     uint8_t bmRequestType = 0;
     uint8_t bRequest = 0;

@@ -128,7 +128,8 @@ void DeviceTreeSim::findDevices(DeviceList* list, uint32_t selector, DeviceQuery
     if (known == nullptr) Host::get().reportMisuse("findDevices with a query this tree did not create");
     tStatus allocationStatus = 0;
     list->devices = static_cast<UsbDevice**>(
-        Host::get().allocator.allocate(sizeof(UsbDevice*) * (found.empty() ? 1 : found.size()), &allocationStatus));
+        Host::get().allocator.allocate(sizeof(UsbDevice*) * (found.empty() ? 1 : found.size()), &allocationStatus,
+                                       "the device list of findDevices"));
     if (injected < 0 || allocationStatus < 0) {
         setFailure(status, allocationStatus < 0 ? allocationStatus : injected);
         return;

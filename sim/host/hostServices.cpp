@@ -5,10 +5,11 @@
 
 namespace sim {
 
-void* Allocator::allocate(size_t size, tStatus* status)
+void* Allocator::allocate(size_t size, tStatus* status, const char* purpose)
 {
     if (status != nullptr && *status < 0) return nullptr;
     ++attempts_;
+    attemptPurposes_.push_back(purpose != nullptr ? purpose : std::to_string(size) + " bytes");
     if (failAll_ || failAt_.count(attempts_) != 0) {
         if (status != nullptr) *status = kHostAllocationFailed;
         return nullptr;
@@ -57,6 +58,7 @@ void Allocator::reset()
     live_.clear();
     total_ = 0;
     attempts_ = 0;
+    attemptPurposes_.clear();
     clearFaults();
 }
 
@@ -193,7 +195,8 @@ void libUnregisterModuleWithKARVEL(_tLibModuleInfo* module, tStatus& status)
 void* _memNewUsingCRT(size_t size, tMemAllocationFlags flags, tStatus* status)
 {
     if (flags != kMemAllocationDefault) Host::get().reportMisuse("allocation with flags other than 4");
-    return Host::get().allocator.allocate(size, status);
+    std::string purpose = "a module allocation of " + std::to_string(size) + " bytes";
+    return Host::get().allocator.allocate(size, status, purpose.c_str());
 }
 
 void _memDelete(void* pointer)

@@ -48,12 +48,16 @@ struct PackageEvent {
 // Counts live blocks; can be told to fail the Nth allocation from now on, or all.
 class Allocator {
 public:
-    void* allocate(size_t size, tStatus* status);
+    // purpose: what the block is for, as reports name it ("the transfer buffer of bench").
+    void* allocate(size_t size, tStatus* status, const char* purpose = nullptr);
     void release(void* pointer);
 
     size_t liveBlocks() const { return live_.size(); }
     size_t liveBytes() const;
     size_t totalAllocations() const { return total_; }
+    // Every attempt since the last reset, failed ones included, by purpose; the
+    // numbers failNth counts.
+    const std::vector<std::string>& attempts() const { return attemptPurposes_; }
     void failNth(size_t nth);  // 1 = the next allocation
     void failAll(bool fail) { failAll_ = fail; }
     void clearFaults();
@@ -64,6 +68,7 @@ private:
     size_t total_ = 0;
     size_t attempts_ = 0;
     std::set<size_t> failAt_;
+    std::vector<std::string> attemptPurposes_;
     bool failAll_ = false;
 };
 

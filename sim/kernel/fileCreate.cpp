@@ -121,6 +121,12 @@ NTSTATUS openResolvedFile(const std::u16string& name, uint32_t shareAccess, File
     file.sharesRead = sharesRead;
     NTSTATUS status = takeSnapshot(resolution.hostPath, file.bytes);
     if (status < 0) return status;
+    auto change = world.contentChanges.find(resolution.hostPath);
+    if (change != world.contentChanges.end()) {
+        if (change->second.afterOpens == 0) file.bytes = change->second.bytes;
+        else --change->second.afterOpens;
+    }
+    record.bytes = file.bytes;
 
     // The handle's value is known only once the table hands it out.
     auto key = std::make_shared<intptr_t>(0);

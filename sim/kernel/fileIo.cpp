@@ -20,9 +20,15 @@ bool isUseFilePosition(const LARGE_INTEGER& offset)
     return offset.u.HighPart == -1 && offset.u.LowPart == 0xFFFFFFFEu;
 }
 
-NTSTATUS injectedReadFailure(FileWorld& world)
+// The read's number is counted here, once per read.
+NTSTATUS injectedReadFailure(FileWorld& world, uint32_t& limit)
 {
     uint64_t number = ++world.readCount;
+    auto shortened = world.faults.shortReads.find(number);
+    if (shortened != world.faults.shortReads.end()) {
+        limit = shortened->second;
+        world.faults.shortReads.erase(shortened);
+    }
     auto byNumber = world.faults.readsByNumber.find(number);
     if (byNumber != world.faults.readsByNumber.end()) {
         NTSTATUS status = byNumber->second;
@@ -111,7 +117,8 @@ extern "C" NTSTATUS ZwReadFile(HANDLE fileHandle, HANDLE event, void* apcRoutine
     }
 
     FileWorld& world = fileWorld();
-    NTSTATUS status = injectedReadFailure(world);
+    uint32_t limit = length;
+    NTSTATUS status = injectedReadFailure(world, limit);
     uint32_t count = 0;
     int64_t size = static_cast<int64_t>(file->bytes.size());
     if (status < 0) {
@@ -119,7 +126,7 @@ extern "C" NTSTATUS ZwReadFile(HANDLE fileHandle, HANDLE event, void* apcRoutine
     } else if (length > 0 && start >= size) {
         status = fileStatus::endOfFile;
     } else {
-        count = static_cast<uint32_t>(std::min<int64_t>(length, size - std::min(start, size)));
+        count = static_cast<uint32_t>(std::min<int64_t>(std::min(length, limit), size - std::min(start, size)));
         if (count > 0) std::memcpy(buffer, file->bytes.data() + start, count);
         file->position = start + count;
     }

@@ -105,6 +105,19 @@ void FileSystem::clearFaults()
     fileWorld().faults = FileFaults{};
 }
 
+void FileSystem::shortenRead(unsigned nth, uint32_t bytes)
+{
+    FileWorld& world = fileWorld();
+    if (nth != 0) world.faults.shortReads[world.readCount + nth] = bytes;
+}
+
+void FileSystem::changeContentAfterOpens(const std::filesystem::path& hostFile, unsigned opens, std::vector<uint8_t> bytes)
+{
+    std::error_code error;
+    std::filesystem::path identity = std::filesystem::weakly_canonical(hostFile, error);
+    fileWorld().contentChanges[error ? hostFile : identity] = ContentChange{opens, std::move(bytes)};
+}
+
 const std::vector<FileOpenRecord>& FileSystem::opens() const
 {
     return fileWorld().opens;

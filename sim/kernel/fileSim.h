@@ -24,6 +24,7 @@ struct FileOpenRecord {
     std::filesystem::path hostPath; // what it resolved to; empty when it did not resolve
     NTSTATUS status = 0;
     HANDLE handle = nullptr; // set only when the open succeeded
+    std::vector<uint8_t> bytes; // what the open saw: reads through its handle bring these
 };
 
 struct FileReadRecord {
@@ -75,6 +76,12 @@ class FileSystem {
     void failSizeQueryNumber(unsigned nth, NTSTATUS status, const std::filesystem::path& hostFile = {});
     void failSetPosition(NTSTATUS status); // FilePositionInformation changes
     void clearFaults();
+    // The Nth read from now brings at most `bytes` bytes and reports success,
+    // even before the end of the file.
+    void shortenRead(unsigned nth, uint32_t bytes);
+    // Once the file has been opened `opens` more times, it holds `bytes`: a
+    // file replaced between two opens, as by an installer running meanwhile.
+    void changeContentAfterOpens(const std::filesystem::path& hostFile, unsigned opens, std::vector<uint8_t> bytes);
 
     const std::vector<FileOpenRecord>& opens() const;
     // An open that another kernel answered, logged beside this one's.

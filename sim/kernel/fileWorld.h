@@ -23,8 +23,15 @@ struct FileFaults {
     std::map<uint64_t, NTSTATUS> readsByNumber; // by the read count that fails
     NTSTATUS sizeQuery = 0;
     NTSTATUS setPosition = 0;
+    std::map<uint64_t, uint32_t> shortReads; // by read count: at most that many bytes
     FileCallFaults opens;       // ZwCreateFile calls with a well-formed request
     FileCallFaults sizeQueries; // FileStandardInformation queries
+};
+
+// A file whose content is replaced once it has been opened a number of times.
+struct ContentChange {
+    uint64_t afterOpens = 0; // successful opens of the file still to come before the change
+    std::vector<uint8_t> bytes;
 };
 
 struct FileWorld {
@@ -33,6 +40,7 @@ struct FileWorld {
     std::map<FileHoldToken, std::filesystem::path> heldElsewhere;
     FileHoldToken nextHold = 1;
     FileFaults faults;
+    std::map<std::filesystem::path, ContentChange> contentChanges; // by canonical host path
     uint64_t readCount = 0; // ZwReadFile calls on valid handles so far
     std::vector<FileOpenRecord> opens;
     std::vector<FileReadRecord> reads;

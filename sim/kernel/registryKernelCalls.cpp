@@ -97,8 +97,7 @@ struct RegistryKernelSide {
             if (component.empty()) return finish(kStatusObjectNameInvalid);
 
         std::u16string pathKey = foldedPath(components);
-        auto fault = registry.createFaults_.find(pathKey);
-        if (fault != registry.createFaults_.end()) return finish(fault->second);
+        if (NTSTATUS fault = Registry::injectedFailure(registry.createFaults_, pathKey)) return finish(fault);
 
         // Open every component; only the last may be created, and only inside
         // the hive: the roots above it take no new keys.
@@ -169,20 +168,33 @@ struct RegistryKernelSide {
         if (informationClass != kKeyValuePartialInformation) return finish(kStatusInvalidParameter);
         if (open == registry.openKeys_.end() || open->second.key->deleted) return finish(kStatusKeyDeleted);
 
-        auto fault = registry.queryFaults_.find({open->second.foldedPath, folded(name)});
-        if (fault != registry.queryFaults_.end()) return finish(fault->second);
-
         const RegistryKey& key = *open->second.key;
         auto found = key.values.find(folded(name));
+        auto fillHeader = [&](uint32_t type, uint32_t dataLength) {
+            *resultLength = kPartialInformationHeader + dataLength;
+            if (length < kPartialInformationHeader) return false;
+            putWord(information, offsetof(KEY_VALUE_PARTIAL_INFORMATION, TitleIndex), 0);
+            putWord(information, offsetof(KEY_VALUE_PARTIAL_INFORMATION, Type), type);
+            putWord(information, offsetof(KEY_VALUE_PARTIAL_INFORMATION, DataLength), dataLength);
+            return true;
+        };
+
+        if (NTSTATUS fault = Registry::injectedFailure(registry.queryFaults_, {open->second.foldedPath, folded(name)})) {
+            // An overflow reports what would not fit, as the kernel's own does.
+            if (fault == kStatusBufferOverflow) {
+                if (found == key.values.end()) {
+                    fillHeader(0, 0);
+                } else {
+                    fillHeader(found->second.type, static_cast<uint32_t>(found->second.data.size()));
+                }
+            }
+            return finish(fault);
+        }
         if (found == key.values.end()) return finish(kStatusObjectNameNotFound);
 
         const StoredValue& value = found->second;
         uint32_t dataLength = static_cast<uint32_t>(value.data.size());
-        *resultLength = kPartialInformationHeader + dataLength;
-        if (length < kPartialInformationHeader) return finish(kStatusBufferTooSmall);
-        putWord(information, offsetof(KEY_VALUE_PARTIAL_INFORMATION, TitleIndex), 0);
-        putWord(information, offsetof(KEY_VALUE_PARTIAL_INFORMATION, Type), value.type);
-        putWord(information, offsetof(KEY_VALUE_PARTIAL_INFORMATION, DataLength), dataLength);
+        if (!fillHeader(value.type, dataLength)) return finish(kStatusBufferTooSmall);
         // Data that does not fit is not copied at all, not even in part.
         if (length < *resultLength) return finish(kStatusBufferOverflow);
         if (dataLength != 0)

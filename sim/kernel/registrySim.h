@@ -86,9 +86,13 @@ public:
     std::optional<RegistryValue> value(const std::string& keyPath, const std::string& name) const;
 
     // Faults: ZwCreateKey of that key, or ZwQueryValueKey of that value,
-    // returns the status instead of doing its work.
-    void failCreateKey(const std::string& path, NTSTATUS status);
-    void failQuery(const std::string& keyPath, const std::string& valueName, NTSTATUS status);
+    // returns the status instead of doing its work: at every call, or with a
+    // number, at that call only (1 = the next call of that key or value).
+    // The status must be a failure. A query failing with
+    // STATUS_BUFFER_OVERFLOW still fills the record's header and the result
+    // length, as the kernel does when the data does not fit.
+    void failCreateKey(const std::string& path, NTSTATUS status, uint64_t number = 0);
+    void failQuery(const std::string& keyPath, const std::string& valueName, NTSTATUS status, uint64_t number = 0);
     void clearFaults();
 
     // Every ZwCreateKey and ZwQueryValueKey since the last reset, in order.
@@ -115,8 +119,18 @@ private:
 
     std::shared_ptr<RegistryKey> root_;  // the object namespace's root, holding Registry\Machine
     std::map<intptr_t, OpenKey> openKeys_;
-    std::map<std::u16string, NTSTATUS> createFaults_;
-    std::map<std::pair<std::u16string, std::u16string>, NTSTATUS> queryFaults_;
+    // The faults of one key or value, and how often it was called since they were set.
+    struct CallFaults {
+        NTSTATUS everyCall = 0;
+        std::map<uint64_t, NTSTATUS> byNumber;
+        uint64_t calls = 0;
+    };
+    // The status a call of this key or value fails with, or 0; counts the call.
+    template <typename Key>
+    static NTSTATUS injectedFailure(std::map<Key, CallFaults>& faults, const Key& key);
+
+    std::map<std::u16string, CallFaults> createFaults_;
+    std::map<std::pair<std::u16string, std::u16string>, CallFaults> queryFaults_;
     std::vector<RegistryCall> calls_;
 };
 

@@ -16,25 +16,12 @@
 
 #include <nlohmann/json.hpp>
 
+#include "tests/lab/labProcess.h"
+
 namespace {
 
-struct Outcome {
-    int exitCode = -1;
-    std::string output;  // standard output only
-};
-
-Outcome runLab(const std::string& arguments)
-{
-    Outcome outcome;
-    std::string command = std::string(MORVANEK_LAB_EXECUTABLE) + " " + arguments + " 2>/dev/null";
-    FILE* pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr) return outcome;
-    char buffer[4096];
-    for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;) outcome.output.append(buffer, n);
-    int status = pclose(pipe);
-    outcome.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    return outcome;
-}
+using lab_tests::Outcome;
+using lab_tests::runLab;
 
 // Standard output and standard error apart, with text fed to standard input.
 struct Streams {

@@ -4,9 +4,13 @@
 // the command, with its exit code, as tests of their own (ctest -L lab).
 #include <gtest/gtest.h>
 
+#include <set>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "morvanek-lab/lib/scenarioError.h"
+#include "morvanek-lab/lib/lab.h"
 #include "morvanek-lab/lib/scenarioParser.h"
 
 namespace {
@@ -80,6 +84,22 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
         {R"({"devices": [{"name": "a"}], "steps": [{"do": "unplug", "device": "a", "startsIn": "loader"}]})",
          "/steps/0/startsIn", "unknown field \"startsIn\""},
         {R"({"drives": {"C": {"files": {"a|b.bin": {"hex": "00"}}}}})", "/drives/C/files/a|b.bin", "may not hold '|'"},
+        {R"({"registry": {"faults": [{"key": "HKLM\\Software", "value": "X", "status": 0}]}})",
+         "/registry/faults/0/status", "0 is not a failure"},
+        {R"({"registry": {"faults": [{"key": "HKLM\\Software", "status": -1, "number": 0}]}})",
+         "/registry/faults/0/number", "calls count from 1"},
+        {R"({"devices": [{"name": "a", "faults": {"failFreeBuffer": 1}}]})", "/devices/0/faults/failFreeBuffer",
+         "1 is not a failure"},
+        {R"({"devices": [{"name": "a", "faults": {"lostStatus": [3, 0]}}]})", "/devices/0/faults/lostStatus/1",
+         "requests count from 1"},
+        {R"({"devices": [{"name": "a", "faults": {"stuckBits": [{"address": 1, "mask": 256}]}}]})",
+         "/devices/0/faults/stuckBits/0/mask", "above the largest value"},
+        {R"({"fileFaults": {"shortReads": {"number": 0, "bytes": 1}}})", "/fileFaults/shortReads/number",
+         "reads count from 1"},
+        {R"({"fileFaults": {"changeContent": {"file": "C:\\a.bin", "afterOpens": 0, "hex": "00"}}})",
+         "/fileFaults/changeContent/afterOpens", "before its first open"},
+        {R"({"fileFaults": {"changeContent": {"file": "C:\\a.bin", "hex": "00", "text": "x"}}})",
+         "/fileFaults/changeContent", "exactly one of"},
         {R"({"expect": {"devices": {"ghost": {"mode": "loader"}}}})",
          "/expect/devices/ghost", "no device named \"ghost\""},
         {R"({"devices": [{"name": "a"}], "expect": {"devices": {"a": {"mode": "bootloader"}}}})",
@@ -178,6 +198,48 @@ TEST(ScenarioParser, TakesNumbersAndKeyPathsInEachOfTheirForms)
     EXPECT_EQ(scenario.registry.keys[1].path, "\\Registry\\Machine\\Software\\B");
     EXPECT_EQ(scenario.registry.keys[2].path, "\\Registry\\Machine\\Software\\C");
     EXPECT_EQ(scenario.registry.keys[2].values.at(0).data, (std::vector<uint8_t>{7, 0, 0, 0}));
+}
+
+// The faults a real device, registry and file system have, as a scenario names them.
+TEST(ScenarioParser, TakesTheFaultsOfARealDeviceRegistryAndFileSystem)
+{
+    lab::Scenario scenario = lab::parseScenarioText(
+        R"({"devices": [{"name": "a", "faults": {"lostStatus": [4, 9], "stuckBits": {"address": "0x0210", "mask": 1},
+                                                "deadErases": 2, "failTransferBuffer": [2], "failFreeBuffer": -5,
+                                                "failCloseStream": "0xC0000001"}}],
+            "registry": {"faults": [{"key": "HKLM\\Software\\A", "value": "V", "status": "0x80000005", "number": 3}]},
+            "fileFaults": {"shortReads": [{"number": 2, "bytes": 100}],
+                           "changeContent": {"file": "c:/images/a.bin", "afterOpens": 2, "hex": "AA 55"}}})",
+        "faults.json", ".");
+    const sim::DeviceFaults& faults = scenario.devices.at(0).options.faults;
+    EXPECT_EQ(faults.lostStatus, (std::set<uint64_t>{4, 9}));
+    ASSERT_EQ(faults.stuckBits.size(), 1u);
+    EXPECT_EQ(faults.stuckBits[0].address, 0x0210);
+    EXPECT_EQ(faults.stuckBits[0].mask, 1);
+    EXPECT_EQ(faults.deadErases, (std::set<uint16_t>{2}));
+    EXPECT_EQ(faults.failTransferBuffers, (std::set<uint64_t>{2}));
+    EXPECT_EQ(faults.failFreeBuffer, -5);
+    EXPECT_EQ(faults.failCloseStream, static_cast<int32_t>(0xC0000001u));
+    ASSERT_EQ(scenario.registry.faults.size(), 1u);
+    EXPECT_EQ(scenario.registry.faults[0].number, 3u);
+    EXPECT_EQ(scenario.registry.faults[0].status, static_cast<int32_t>(0x80000005u));
+    EXPECT_EQ(scenario.fileFaults.shortReads, (std::vector<std::pair<unsigned, uint32_t>>{{2, 100}}));
+    ASSERT_EQ(scenario.fileFaults.contentChanges.size(), 1u);
+    EXPECT_EQ(scenario.fileFaults.contentChanges[0].dosPath, "C:\\images\\a.bin");
+    EXPECT_EQ(scenario.fileFaults.contentChanges[0].afterOpens, 2u);
+    EXPECT_EQ(scenario.fileFaults.contentChanges[0].bytes, (std::vector<uint8_t>{0xAA, 0x55}));
+}
+
+// A changed file must be one of the scenario's: found when the world is built.
+TEST(ScenarioParser, AChangedFileMissingFromTheDrivesIsRefusedWhenTheWorldIsBuilt)
+{
+    lab::Scenario scenario = lab::parseScenarioText(
+        R"({"drives": {"C": {"files": {"a.bin": {"hex": "00"}}}},
+            "fileFaults": {"changeContent": [{"file": "C:\\b.bin", "hex": "01"}]}})",
+        "missing.json", ".");
+    lab::ScenarioResult result = lab::runScenario(scenario, {});
+    EXPECT_NE(result.invalid.find("missing.json: /fileFaults/changeContent/0/file: no such file"), std::string::npos)
+        << result.invalid;
 }
 
 }  // namespace
