@@ -71,6 +71,19 @@ public:
     std::string duplicate_;
     std::string place_;
 
+    // Where the parser stands now, as a JSON pointer.
+    std::string pointer() const
+    {
+        std::string path;
+        for (const Frame& frame : frames_) {
+            std::string token = frame.isArray ? std::to_string(frame.index) : frame.key;
+            std::string escaped;
+            for (char c : token) escaped += c == '~' ? std::string("~0") : c == '/' ? std::string("~1") : std::string(1, c);
+            path += "/" + escaped;
+        }
+        return path;
+    }
+
 private:
     struct Frame {
         bool isArray;
@@ -82,18 +95,6 @@ private:
     void elementDone()
     {
         if (!frames_.empty() && frames_.back().isArray) ++frames_.back().index;
-    }
-
-    std::string pointer() const
-    {
-        std::string path;
-        for (const Frame& frame : frames_) {
-            std::string token = frame.isArray ? std::to_string(frame.index) : frame.key;
-            std::string escaped;
-            for (char c : token) escaped += c == '~' ? std::string("~0") : c == '/' ? std::string("~1") : std::string(1, c);
-            path += "/" + escaped;
-        }
-        return path;
     }
 
     std::vector<Frame> frames_;
@@ -110,6 +111,9 @@ Scenario parseScenarioText(const std::string& text, const std::string& fileName,
             text, [check](int, nlohmann::json::parse_event_t event, nlohmann::json& parsed) { return (*check)(event, parsed); });
     } catch (const nlohmann::json::parse_error& error) {
         throw ScenarioError(fileName, lineAndColumn(text, error.byte), syntaxProblem(error));
+    } catch (const nlohmann::json::out_of_range&) {
+        // Valid JSON, such as 1e999, that no double can hold.
+        throw ScenarioError(fileName, check->pointer(), "a number too large to read");
     }
     if (!check->duplicate_.empty())
         throw ScenarioError(fileName, check->place_, fmt::format("the field \"{}\" appears twice in one object", check->duplicate_));

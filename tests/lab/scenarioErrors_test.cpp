@@ -28,6 +28,8 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
          "found a fractional number"},
         {R"({"devices": [{"name": "a", "vendorId": "0x5C1G"}]})", "/devices/0/vendorId", "\"0x5C1G\" is not a number"},
         {R"({"devices": [{"name": "a", "vendorId": -1}]})", "/devices/0/vendorId", "is negative"},
+        {R"({"devices": [{"name": "a", "faults": {"stallRequests": [1, 1e999]}}]})",
+         "/devices/0/faults/stallRequests/1", "a number too large to read"},
         {R"({"devices": [{"name": "a", "memory": [{"address": "0xFFFF", "hex": "00 01"}]}]})",
          "/devices/0/memory/0", "run past the end"},
         {R"({"devices": [{"name": "a", "memory": [{"address": 0, "hex": "ABC"}]}]})",
