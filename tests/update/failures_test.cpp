@@ -38,8 +38,9 @@ TEST_P(Failures, LeaveTheDeviceInLoaderModeAndReportOnlyTheirOwnMessages)
     const std::vector<uint8_t> identityBefore = hardware->readMemory(identityPage(c.loaderProductId), 512);
     if (c.world) c.world(image);
 
-    sim::LoaderModeDevice& loader =
-        run(hardware, arrival, [&](sim::LoaderModeDevice& device) { device.failDescriptor = c.descriptorFails; });
+    sim::LoaderModeDevice& loader = run(hardware, arrival, [fails = c.descriptorFails](sim::LoaderModeDevice& device) {
+        device.failDescriptor = fails;
+    });
 
     EXPECT_EQ(requestLines(*hardware), c.requests);
     EXPECT_EQ(logLines(), c.log);
