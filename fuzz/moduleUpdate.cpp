@@ -5,6 +5,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
@@ -37,9 +38,17 @@ constexpr uint16_t kMostRequests = 640;
 constexpr uint16_t kMostFileReads = 64;
 constexpr uint16_t kMostAllocations = 16;
 
+// Another build of the module (MORVANEK_MODULE_FILE), such as a deliberately
+// broken one, to see that the checks catch it.
+std::string modulePath()
+{
+    const char* other = std::getenv("MORVANEK_MODULE_FILE");
+    return other != nullptr && *other != 0 ? other : MORVANEK_FUZZ_MODULE;
+}
+
 struct Harness {
     // Loaded once: the fuzzer's coverage counters live in it.
-    sim::ModuleImage module{MORVANEK_FUZZ_MODULE};
+    sim::ModuleImage module{modulePath()};
     std::filesystem::path driveC;
 };
 
@@ -48,8 +57,9 @@ Harness* harness = nullptr;
 std::string instanceKey(uint16_t vendorId, uint16_t productId, uint32_t serialNumber)
 {
     char text[128];
-    std::snprintf(text, sizeof text, "\\Registry\\Machine\\System\\CurrentControlSet\\Enum\\USB\\Vid_%04X&Pid_%04X\\%08X",
-                  vendorId, productId, serialNumber);
+    std::snprintf(text, sizeof text,
+                  "\\Registry\\Machine\\System\\CurrentControlSet\\Enum\\USB\\Vid_%04X&Pid_%04X\\%08X", vendorId,
+                  productId, serialNumber);
     return text;
 }
 
@@ -76,9 +86,10 @@ uint16_t hexNumber(const std::string& text)
     uint32_t value = 0;
     for (size_t i = 0; i < text.size() && i < 4; ++i) {
         const char c = text[i];
-        const int digit = c >= '0' && c <= '9' ? c - '0' : c >= 'A' && c <= 'F' ? c - 'A' + 10
-                          : c >= 'a' && c <= 'f'                                 ? c - 'a' + 10
-                                                                                 : 0;
+        const int digit = c >= '0' && c <= '9'   ? c - '0'
+                          : c >= 'A' && c <= 'F' ? c - 'A' + 10
+                          : c >= 'a' && c <= 'f' ? c - 'a' + 10
+                                                 : 0;
         value = value << 4 | static_cast<uint32_t>(digit);
     }
     return static_cast<uint16_t>(value);
@@ -203,8 +214,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size)
     const uint16_t identityPage = sim::findLoaderFlashLayout(input.loaderProductId)->identityPage;
     options.memory.push_back({static_cast<uint16_t>(identityPage + 0x1F0),
                               std::vector<uint8_t>(input.identityBlock.begin(), input.identityBlock.end())});
-    options.memory.push_back({kSignatureAddress,
-                              std::vector<uint8_t>(input.signatureArea.begin(), input.signatureArea.end())});
+    options.memory.push_back(
+        {kSignatureAddress, std::vector<uint8_t>(input.signatureArea.begin(), input.signatureArea.end())});
     armFault(input, options);
     std::shared_ptr<sim::PhysicalDevice> device = sim::makeEmulatedDevice(options);
     buildWorld(input, device->identity());

@@ -10,7 +10,7 @@ constexpr size_t kHeaderOffset = 514;
 constexpr size_t kHeaderBytes = 60;
 
 class Reader {
-public:
+  public:
     Reader(const uint8_t* data, size_t size) : data_(data), size_(size) {}
 
     uint8_t byte() { return position_ < size_ ? data_[position_++] : 0; }
@@ -27,7 +27,7 @@ public:
     }
     std::vector<uint8_t> rest() { return bytes(size_ - std::min(position_, size_)); }
 
-private:
+  private:
     const uint8_t* data_;
     size_t size_;
     size_t position_ = 0;

@@ -23,7 +23,7 @@ std::string hex(uint32_t value)
 
 // What the flash programming has done so far in one update, byte by byte.
 class ProgrammingState {
-public:
+  public:
     void erasePage(uint16_t page)
     {
         for (uint32_t a = page * kPageBytes; a < (page + 1u) * kPageBytes && a < kFlashBytes; ++a) {
@@ -45,7 +45,7 @@ public:
     int written(uint16_t address) const { return written_[address]; }
     bool verified(uint16_t address) const { return verified_[address]; }
 
-private:
+  private:
     static constexpr uint32_t kFlashBytes = 0x10000;
     std::vector<int> written_ = std::vector<int>(kFlashBytes, -1);
     std::vector<bool> verified_ = std::vector<bool>(kFlashBytes, false);
@@ -133,7 +133,8 @@ std::vector<std::string> devicePromisesBroken(const sim::PhysicalDevice& device,
 std::vector<std::string> leftoversAndMisuse()
 {
     std::vector<std::string> problems = sim::Host::get().leftovers();
-    for (const std::string& handle : sim::kernel::openHandleDescriptions()) problems.push_back("open handle: " + handle);
+    for (const std::string& handle : sim::kernel::openHandleDescriptions())
+        problems.push_back("open handle: " + handle);
     for (const std::string& misuse : sim::Host::get().misuse) problems.push_back("host misuse: " + misuse);
     for (const std::string& misuse : sim::kernel::misuseReports()) problems.push_back("kernel misuse: " + misuse);
     return problems;
