@@ -119,12 +119,16 @@ void buildWorld(const fuzzing::UpdateInput& input, const sim::IdentityValues& id
         setValueIfPossible(kClassKeyParent + input.driver.text(), "Firmware", input.firmware);
     }
 
-    writeFile(harness->driveC / "images" / "fw.bin", input.image);
+    // One file under every name: the others are links to it.
+    const std::filesystem::path image = harness->driveC / "images" / "fw.bin";
+    writeFile(image, input.image);
+    const std::filesystem::path drivers = harness->driveC / "WINDOWS" / "system32" / "drivers";
+    std::filesystem::create_directories(drivers);
     for (uint16_t productId : productIds) {
         for (const char* suffix : {"", "0200"}) {
             char name[64];
             std::snprintf(name, sizeof name, "QVUSB%04X%s.bin", productId, suffix);
-            writeFile(harness->driveC / "WINDOWS" / "system32" / "drivers" / name, input.image);
+            std::filesystem::create_hard_link(image, drivers / name);
         }
     }
 }
