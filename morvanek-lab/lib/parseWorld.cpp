@@ -1,6 +1,7 @@
 // The world's parts of a scenario: host, registry, drives and file faults.
 #include <algorithm>
 #include <cctype>
+#include <cstring>
 #include <fstream>
 #include <set>
 #include <sstream>
@@ -92,6 +93,12 @@ std::string driveRelativePath(const JsonNode& node, const std::string& raw)
     std::string part;
     while (std::getline(parts, part, '\\')) {
         if (part.empty() || part == "." || part == "..") node.fail("a file name may not contain empty, \".\" or \"..\" parts");
+        // What neither Windows nor the host's file system could hold as a name.
+        if (part.size() > 255) node.fail("a part of a file name is longer than 255 bytes");
+        for (char c : part) {
+            if (static_cast<unsigned char>(c) < 0x20 || std::strchr("<>:\"|?*", c) != nullptr)
+                node.fail("a file name may not contain control characters or any of < > : \" | ? *");
+        }
     }
     return path;
 }

@@ -70,6 +70,37 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
     }
 }
 
+// A drive's file name must be one a file system can hold, or the run would
+// fail later with the lab's own error instead of the scenario's.
+TEST(MalformedScenario, RefusesFileNamesNoFileSystemHolds)
+{
+    struct BadName {
+        std::string name;  // as JSON text
+        const char* problem;
+    };
+    const BadName cases[] = {
+        {std::string(256, 'a'), "longer than 255 bytes"},
+        {"dir\\" + std::string(256, 'b') + ".bin", "longer than 255 bytes"},
+        {"a\\u0000b.bin", "control characters"},
+        {"a\\u001Fb.bin", "control characters"},
+        {"a?.bin", "any of < > : \" | ? *"},
+        {"dir\\\\a|b.bin", "any of < > : \" | ? *"},
+    };
+    for (const BadName& bad : cases) {
+        SCOPED_TRACE(bad.name);
+        const std::string text = R"({"drives": {"C": {"files": {")" + bad.name + R"(": {"hex": "00"}}}}})";
+        try {
+            lab::parseScenarioText(text, "bad.json", MORVANEK_SOURCE_DIR "/tests/lab/scenarios");
+            ADD_FAILURE() << "accepted";
+        } catch (const lab::ScenarioError& error) {
+            EXPECT_EQ(error.where().rfind("/drives/C/files/", 0), 0u) << error.what();
+            EXPECT_NE(error.problem().find(bad.problem), std::string::npos) << error.what();
+        }
+    }
+    const std::string longest = R"({"drives": {"C": {"files": {")" + std::string(255, 'a') + R"(": {"hex": "00"}}}}})";
+    EXPECT_NO_THROW(lab::parseScenarioText(longest, "good.json", MORVANEK_SOURCE_DIR "/tests/lab/scenarios"));
+}
+
 // Numbers as JSON numbers, decimal or hexadecimal text; registry keys as the
 // kernel or the registry editor names them.
 TEST(ScenarioParser, TakesNumbersAndKeyPathsInEachOfTheirForms)
