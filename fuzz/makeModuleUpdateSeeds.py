@@ -8,7 +8,7 @@ HERE = os.path.join(os.path.dirname(os.path.abspath(__file__)), "corpus", "modul
 CLASS = "{6D2F4B10-93A7-11CF-B4E8-00C05D7A3F21}"
 HEADER = "0143C000000000010002000302000A"
 FAULTS = ["none", "stallRequest", "stallKind", "corruptRead", "unplugAtRequest", "failAllocation",
-          "failRegistryQuery", "failFileRead", "failSizeQuery", "failSetPosition"]
+          "failRegistryQuery", "failFileRead", "failSizeQuery", "failSetPosition", "failDeviceTree", "refuseStream"]
 SIGNATURE_A = bytes([0x30, 0xE4, 0x10, 0x75, 0x96, 0x11, 0x75, 0x97, 0x80, 0xE5, 0x96, 0x20, 0xE7, 0xFB, 0xE4, 0x90])
 SIGNATURE_B = bytes([0x83, 0x02, 0x0C, 0x04, 0xE4, 0x93, 0xFC, 0x74, 0x01, 0x93, 0xFD, 0x74, 0x02, 0x93, 0xFE, 0x74])
 FORMS = {None: 0, "text": 1, "textWithoutNul": 2, "expandText": 3, "binary": 4}
@@ -72,6 +72,10 @@ seed("failDriverQuery", fault="failRegistryQuery", argument=1)
 seed("failFileRead", fault="failFileRead", argument=2)
 seed("failSizeQuery", fault="failSizeQuery")
 seed("failSetPosition", fault="failSetPosition")
+for which, name in enumerate(["CreateQuery", "SetAttribute", "FindDevices", "AddListener", "RemoveListener"]):
+    seed("failTree" + name, fault="failDeviceTree", argument=which)
+seed("refuseStream", fault="refuseStream", argument=0)
+seed("refuseTransferBuffer", fault="refuseStream", argument=1)
 seed("firmwareWithoutNul", firmware="C:\\images\\fw.bin", forms={"firmware": "textWithoutNul"})
 seed("driverExpandText", forms={"driver": "expandText"})
 seed("longFirmwarePath", firmware="C:\\" + "d\\" * 120 + "fw.bin")

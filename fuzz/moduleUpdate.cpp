@@ -149,6 +149,9 @@ void armFault(const fuzzing::UpdateInput& input, sim::EmulatedDeviceOptions& opt
     case fuzzing::FaultKind::unplugAtRequest:
         options.faults.unplugAtRequest = 1 + argument % kMostRequests;
         break;
+    case fuzzing::FaultKind::refuseStream:
+        (argument % 2 == 0 ? options.faults.refuseOpenStream : options.faults.refuseAllocateBuffer) = true;
+        break;
     default:
         break;
     }
@@ -182,6 +185,27 @@ void armWorldFault(const fuzzing::UpdateInput& input)
     case fuzzing::FaultKind::failSetPosition:
         sim::kernel::files().failSetPosition(kUnsuccessful);
         break;
+    case fuzzing::FaultKind::failDeviceTree: {
+        sim::TreeFaults& faults = sim::Host::get().tree()->faults;
+        switch (argument % 5) {
+        case 0:
+            faults.createQuery = true;
+            break;
+        case 1:
+            faults.setAttribute = true;
+            break;
+        case 2:
+            faults.findDevices = true;
+            break;
+        case 3:
+            faults.addListenerCalls = {1 + argument / 5 % 2};
+            break;
+        default:
+            faults.removeListener = true;
+            break;
+        }
+        break;
+    }
     default:
         break;
     }

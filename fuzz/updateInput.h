@@ -50,6 +50,8 @@ enum class FaultKind : uint8_t {
     failFileRead,       // the argument-th file read fails
     failSizeQuery,
     failSetPosition,
+    failDeviceTree,  // one of the tree's calls (argument modulo 5) fails
+    refuseStream,    // the device refuses its stream (argument even) or transfer buffer
     count
 };
 
