@@ -1,5 +1,6 @@
 // The .reg importer on any bytes: a file it refuses changes nothing; a file it
-// takes, exported and read back, gives the same hive and the same text again.
+// takes, exported and read back, gives the same keys, values, types and data,
+// and the same text again.
 #include <cstddef>
 #include <cstdint>
 #include <stdexcept>
@@ -13,6 +14,21 @@ namespace {
 
 // Something a refused file must leave as it was.
 constexpr const char* kStandingKey = "\\Registry\\Machine\\Software\\Standing";
+
+// The hive as keys and values, for comparing two registries exactly.
+std::string describe(const sim::kernel::Registry& registry)
+{
+    std::string text;
+    for (const sim::kernel::RegistryKeyContent& key : registry.contents()) {
+        text += "[" + key.path + "]\n";
+        for (const sim::kernel::RegistryValue& value : key.values) {
+            text += "\"" + value.name + "\" type " + std::to_string(value.type) + ":";
+            for (uint8_t byte : value.data) text += " " + std::to_string(byte);
+            text += "\n";
+        }
+    }
+    return text;
+}
 
 }  // namespace
 
@@ -37,6 +53,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size)
         fuzzing::brokenPromise(std::string("the export of an imported file is refused: ") + error.what() + "\n" +
                                exported);
     }
+    const std::string imported = describe(registry);
+    const std::string readBack = describe(again);
+    fuzzing::require(readBack == imported, "the export read back is another hive:\n" + imported + "----\n" + readBack);
     const std::string reexported = sim::regfile::exportRegistryText(again);
     fuzzing::require(reexported == exported,
                      "export, import and export again differ:\n" + exported + "----\n" + reexported);
