@@ -1,23 +1,36 @@
 // morvanek-lab: runs the real loader module against emulated devices and
 // shows what it did. The work is in the lab library; this is the command line.
+//
+// With --json, standard output carries exactly one JSON document whatever
+// happens, errors of the command line included; without it, reports go to
+// standard output and errors and progress to standard error.
 #include <unistd.h>
 
 #include <cstdio>
+#include <cstring>
 #include <iostream>
+#include <string>
+#include <vector>
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
+#include <nlohmann/json.hpp>
 
 #include "lib/examine.h"
 #include "lib/jsonNode.h"
 #include "lib/lab.h"
 #include "lib/reports.h"
+#include "lib/scenarioError.h"
+#include "source/versionServices.h"
 
 namespace {
 
 constexpr const char* kExitCodes =
     "Exit codes: 0 success, 1 an expectation failed, 2 a scenario (or the command line) is invalid, "
     "3 the lab itself failed (for example, the module cannot be loaded).";
+
+const char* const kCommands[] = {"run", "demo", "inspect"};
+const char* const kInspectCommands[] = {"image", "identity"};
 
 struct CommonOptions {
     bool json = false;
@@ -27,24 +40,58 @@ struct CommonOptions {
     std::vector<std::string> memory;
 };
 
+// How the command reports what stopped it: a line on standard error, or the
+// one JSON document on standard output.
+class Reporter {
+public:
+    explicit Reporter(bool json) : json_(json) {}
+
+    int fail(int exitCode, const std::string& message) const
+    {
+        if (json_) {
+            nlohmann::json document = {{"exitCode", exitCode}, {"error", message}};
+            std::cout << document.dump(2, ' ', false, nlohmann::json::error_handler_t::replace) << "\n";
+        } else {
+            fmt::print(stderr, "morvanek-lab: {}\n", message);
+        }
+        return exitCode;
+    }
+
+private:
+    bool json_;
+};
+
 void addCommonOptions(CLI::App& command, CommonOptions& options)
 {
     command.add_flag("--json", options.json, "write one machine-readable report, and nothing else, on standard output");
     command.add_flag("--trace", options.trace, "list every request each device received");
-    command.add_option("--memory", options.memory, "show device memory: ADDRESS:LENGTH, such as 0x0200:64 (repeatable)");
+    // One value per --memory, so that it never swallows the scenario files after it.
+    command.add_option("--memory", options.memory, "show device memory: ADDRESS:LENGTH, such as 0x0200:64 (repeatable)")
+        ->allow_extra_args(false);
     command.add_flag("--no-progress", options.noProgress, "no progress line, even on a terminal");
     command.add_option("--module", options.modulePath, "the module to load (default: the one built beside the lab)");
 }
 
-// "0x0200:64" -> address and length; throws ScenarioError-free CLI validation errors.
+// "0x0200:64" -> address and length, inside the device's 64 KiB.
 lab::MemoryRange parseMemoryRange(const std::string& text)
 {
     size_t colon = text.find(':');
     auto address = lab::parseNumberText(text.substr(0, colon));
     auto length = colon == std::string::npos ? std::optional<int64_t>(16) : lab::parseNumberText(text.substr(colon + 1));
-    if (!address || !length || *address < 0 || *address > 0xFFFF || *length <= 0 || *length > 0x10000)
-        throw CLI::ValidationError("--memory", "\"" + text + "\" is not ADDRESS:LENGTH within 0x0000 to 0xFFFF");
+    if (!address || !length || *address < 0 || *length <= 0)
+        throw lab::CommandError(lab::kExitScenarioInvalid, "--memory \"" + text + "\" is not ADDRESS:LENGTH");
+    if (*address > 0xFFFF || *length > 0x10000 - *address) {
+        throw lab::CommandError(lab::kExitScenarioInvalid,
+                                fmt::format("--memory \"{}\" runs past the end of the device's memory: addresses go "
+                                            "from 0x0000 to 0xFFFF",
+                                            text));
+    }
     return {static_cast<uint16_t>(*address), static_cast<size_t>(*length)};
+}
+
+bool progressWanted(const CommonOptions& common)
+{
+    return !common.noProgress && isatty(fileno(stderr)) != 0;
 }
 
 int runScenarios(const std::vector<std::string>& files, const CommonOptions& common)
@@ -52,44 +99,103 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
     lab::RunOptions options;
     options.modulePath = common.modulePath;
     options.trace = common.trace;
-    options.progress = !common.json && !common.noProgress && isatty(fileno(stdout)) != 0;
+    options.progress = progressWanted(common);
     for (const std::string& range : common.memory) options.memoryRanges.push_back(parseMemoryRange(range));
 
     std::vector<lab::ScenarioResult> results;
     for (size_t i = 0; i < files.size(); ++i) {
+        options.scenarioNumber = i + 1;
+        options.scenarioCount = files.size();
         results.push_back(lab::runScenarioFile(files[i], options));
         if (common.json) continue;
-        if (i != 0) std::fputs("\n", stdout);
-        lab::printTextReport(stdout, results.back(), options);
-        std::fflush(stdout);
+        // A scenario that could not run is an error: its line goes to standard error.
+        const lab::ScenarioResult& result = results.back();
+        bool stopped = !result.invalid.empty() || !result.labError.empty();
+        if (i != 0 && !stopped) std::fputs("\n", stdout);
+        lab::printTextReport(stopped ? stderr : stdout, result, options);
+        std::fflush(stopped ? stderr : stdout);
     }
     if (common.json) {
-        std::cout << lab::jsonReport(results, options).dump(2) << "\n";
+        std::cout << lab::jsonReport(results, options).dump(2, ' ', false, nlohmann::json::error_handler_t::replace)
+                  << "\n";
+        // Standard output carries only the report: say what stopped a scenario on standard error too.
+        for (const lab::ScenarioResult& result : results) {
+            if (!result.invalid.empty()) fmt::print(stderr, "morvanek-lab: invalid scenario: {}\n", result.invalid);
+            if (!result.labError.empty()) fmt::print(stderr, "morvanek-lab: {}: {}\n", result.file, result.labError);
+        }
     } else {
         lab::printSummary(stdout, results);
     }
-    // With --json, standard output carries only the report: say what stopped a scenario on standard error too.
-    for (const lab::ScenarioResult& result : results) {
-        if (!common.json) break;
-        if (!result.invalid.empty()) fmt::print(stderr, "morvanek-lab: invalid scenario: {}\n", result.invalid);
-        if (!result.labError.empty()) fmt::print(stderr, "morvanek-lab: {}: {}\n", result.file, result.labError);
-    }
     return lab::combinedExitCode(results);
+}
+
+// The first word that is not an option names the command; CLI11 would call a
+// mistyped one an unexpected argument, which does not help.
+std::string unknownCommand(int argc, char** argv)
+{
+    int at = 1;
+    while (at < argc && argv[at][0] == '-') ++at;
+    if (at == argc) return {};
+    auto known = [](const char* word, const auto& names) {
+        for (const char* name : names) {
+            if (std::strcmp(word, name) == 0) return true;
+        }
+        return false;
+    };
+    if (!known(argv[at], kCommands)) {
+        return fmt::format("unknown command \"{}\"; the commands are run, demo and inspect (morvanek-lab --help)",
+                           argv[at]);
+    }
+    if (std::strcmp(argv[at], "inspect") != 0) return {};
+    ++at;
+    while (at < argc && argv[at][0] == '-') ++at;
+    if (at < argc && !known(argv[at], kInspectCommands)) {
+        return fmt::format("unknown inspect command \"{}\"; inspect image FILE or inspect identity FILE", argv[at]);
+    }
+    return {};
+}
+
+std::string versionText()
+{
+    char text[16];
+    return fmt::format("morvanek-lab for the morvanek module {} (0x{:08X})", tSSVersion(kCurrentVersion).toString(text),
+                       kCurrentVersion);
 }
 
 }  // namespace
 
 int main(int argc, char** argv)
 {
+    bool json = false;
+    bool version = false;
+    for (int i = 1; i < argc; ++i) {
+        json = json || std::strcmp(argv[i], "--json") == 0;
+        version = version || std::strcmp(argv[i], "--version") == 0;
+    }
+    Reporter reporter(json);
+    if (version) {
+        if (json) {
+            std::cout << nlohmann::json{{"version", versionText()}, {"moduleVersion", fmt::format("0x{:08X}", kCurrentVersion)}}.dump(2)
+                      << "\n";
+        } else {
+            fmt::print("{}\n", versionText());
+        }
+        return lab::kExitSuccess;
+    }
+    if (std::string unknown = unknownCommand(argc, argv); !unknown.empty())
+        return reporter.fail(lab::kExitScenarioInvalid, unknown);
+
     CLI::App app{"morvanek-lab: runs the morvanek loader module against emulated loader-mode devices and shows what "
                  "it did to each."};
     app.footer(kExitCodes);
     app.require_subcommand(1);
+    app.add_flag("--version", "say which module this lab was built for");
+    app.add_flag("--json", "with any command: one JSON document on standard output, errors included");
 
     CommonOptions common;
     std::vector<std::string> files;
     CLI::App* run = app.add_subcommand("run", "run scenario files and check their expectations");
-    run->add_option("scenario", files, "scenario files (JSON)")->required();
+    run->add_option("scenario", files, "scenario files (JSON); - reads one from standard input")->required();
     addCommonOptions(*run, common);
 
     CLI::App* demo = app.add_subcommand("demo", "run the bundled demonstration: two devices, one on each loader");
@@ -114,22 +220,26 @@ int main(int argc, char** argv)
 
     try {
         app.parse(argc, argv);
+    } catch (const CLI::CallForHelp& help) {
+        return app.exit(help);
+    } catch (const CLI::CallForAllHelp& help) {
+        return app.exit(help);
     } catch (const CLI::ParseError& error) {
-        int code = app.exit(error);
-        return code == 0 ? 0 : lab::kExitScenarioInvalid;
+        return reporter.fail(lab::kExitScenarioInvalid, std::string(error.what()) + " (morvanek-lab --help)");
     }
 
+    // --json holds wherever it stands on the line.
+    common.json = common.json || json;
+    inspect.json = inspect.json || json;
     try {
         if (run->parsed()) return runScenarios(files, common);
         if (demo->parsed()) return runScenarios({MORVANEK_LAB_DEMO_SCENARIO}, common);
         if (image->parsed()) return lab::inspectImage(inspect, stdout);
         if (identity->parsed()) return lab::inspectIdentity(inspect, stdout);
-    } catch (const CLI::ValidationError& error) {
-        fmt::print(stderr, "morvanek-lab: {}\n", error.what());
-        return lab::kExitScenarioInvalid;
+    } catch (const lab::CommandError& error) {
+        return reporter.fail(error.exitCode(), error.what());
     } catch (const std::exception& error) {
-        fmt::print(stderr, "morvanek-lab: {}\n", error.what());
-        return lab::kExitLabError;
+        return reporter.fail(lab::kExitLabError, error.what());
     }
-    return lab::kExitScenarioInvalid;
+    return reporter.fail(lab::kExitScenarioInvalid, "no command given (morvanek-lab --help)");
 }

@@ -8,6 +8,7 @@
 #include "deviceStory.h"
 #include "examine.h"
 #include "lab.h"
+#include "scenarioError.h"
 
 namespace lab {
 
@@ -110,24 +111,19 @@ int inspectIdentity(const InspectOptions& options, std::FILE* out)
     std::ifstream in(options.file, std::ios::binary);
     std::vector<uint8_t> bytes((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
     if (bytes.size() != 16 && (bytes.size() > 0x10000 || !options.loaderProductId)) {
-        fmt::print(stderr,
-                   "morvanek-lab: {} has {} bytes: give a 16-byte identity block, or a flash dump of at most 65536 "
-                   "bytes together with --loader 0x4A10 or 0x4A20\n",
-                   options.file, bytes.size());
-        return kExitScenarioInvalid;
+        throw CommandError(kExitScenarioInvalid,
+                           fmt::format("{} has {} bytes: give a 16-byte identity block, or a flash dump of at most "
+                                       "65536 bytes together with --loader 0x4A10 or 0x4A20",
+                                       options.file, bytes.size()));
     }
     uint16_t loader = options.loaderProductId.value_or(0x4A10);
     if (sim::findLoaderFlashLayout(loader) == nullptr) {
-        fmt::print(stderr, "morvanek-lab: --loader is 0x4A10 or 0x4A20, not 0x{:04X}\n", loader);
-        return kExitScenarioInvalid;
+        throw CommandError(kExitScenarioInvalid, fmt::format("--loader is 0x4A10 or 0x4A20, not 0x{:04X}", loader));
     }
     RunOptions runOptions;
     runOptions.modulePath = options.modulePath;
     ScenarioResult result = runScenario(identityScenario(options, bytes, loader), runOptions);
-    if (!result.labError.empty()) {
-        fmt::print(stderr, "morvanek-lab: {}\n", result.labError);
-        return kExitLabError;
-    }
+    if (!result.labError.empty()) throw CommandError(kExitLabError, result.labError);
     const RunRecord& record = result.record;
     const DeviceRecord& device = record.devices.at(0);
     sim::IdentityValues before = *identityIn(device, device.flashBefore);

@@ -7,6 +7,7 @@
 #include "imageHeaderText.h"
 #include "examine.h"
 #include "lab.h"
+#include "scenarioError.h"
 
 namespace lab {
 
@@ -70,10 +71,7 @@ int inspectImage(const InspectOptions& options, std::FILE* out)
     RunOptions runOptions;
     runOptions.modulePath = options.modulePath;
     ScenarioResult result = runScenario(comparisonScenario(options, image, versions), runOptions);
-    if (!result.labError.empty()) {
-        fmt::print(stderr, "morvanek-lab: {}\n", result.labError);
-        return kExitLabError;
-    }
+    if (!result.labError.empty()) throw CommandError(kExitLabError, result.labError);
     int32_t selfCheck = result.record.steps.at(0).status.value_or(0);
     std::optional<int32_t> againstExpected;
     if (options.expectedVersion) againstExpected = result.record.steps.at(1).status;

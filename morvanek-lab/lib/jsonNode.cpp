@@ -28,6 +28,28 @@ size_t distance(const std::string& a, const std::string& b)
     return row[b.size()];
 }
 
+// Digits that parseNumberText refused only for their size.
+bool isTooLargeNumberText(std::string text)
+{
+    text.erase(0, text.find_first_not_of(" \t-"));
+    bool hex = text.size() > 2 && text[0] == '0' && (text[1] == 'x' || text[1] == 'X');
+    if (hex) text.erase(0, 2);
+    if (text.empty()) return false;
+    for (char c : text) {
+        bool digit = hex ? std::isxdigit(static_cast<unsigned char>(c)) != 0 : std::isdigit(static_cast<unsigned char>(c)) != 0;
+        if (!digit && c != ' ' && c != '\t') return false;
+    }
+    return true;
+}
+
+std::string notANumber(const std::string& text, const char* example)
+{
+    if (isTooLargeNumberText(text)) return fmt::format("\"{}\" is out of range: too large for any field here", text);
+    return fmt::format("\"{}\" is not a number (write it as {})", text, example);
+}
+
+}  // namespace
+
 std::string escapePointerToken(const std::string& token)
 {
     std::string out;
@@ -36,14 +58,14 @@ std::string escapePointerToken(const std::string& token)
             out += "~0";
         } else if (c == '/') {
             out += "~1";
+        } else if (static_cast<unsigned char>(c) < 0x20) {
+            out += fmt::format("\\u{:04X}", static_cast<int>(c));  // shown, never printed raw
         } else {
             out += c;
         }
     }
     return out;
 }
-
-}  // namespace
 
 std::optional<int64_t> parseNumberText(const std::string& raw)
 {
@@ -194,7 +216,7 @@ uint64_t JsonNode::unsignedNumber(uint64_t maximum) const
         value = value_->get<int64_t>();
     } else if (value_->is_string()) {
         std::optional<int64_t> parsed = parseNumberText(value_->get<std::string>());
-        if (!parsed) fail(fmt::format("\"{}\" is not a number (write it as 19024 or \"0x4A50\")", value_->get<std::string>()));
+        if (!parsed) fail(notANumber(value_->get<std::string>(), "19024 or \"0x4A50\""));
         value = *parsed;
     } else {
         fail("expected a number (such as 19024 or \"0x4A50\"), found " + typeName());
@@ -214,7 +236,7 @@ int32_t JsonNode::status() const
         value = value_->is_number_unsigned() ? static_cast<int64_t>(value_->get<uint64_t>()) : value_->get<int64_t>();
     } else if (value_->is_string()) {
         std::optional<int64_t> parsed = parseNumberText(value_->get<std::string>());
-        if (!parsed) fail(fmt::format("\"{}\" is not a status (write it as -50150 or \"0xC000026C\")", value_->get<std::string>()));
+        if (!parsed) fail(notANumber(value_->get<std::string>(), "-50150 or \"0xC000026C\""));
         value = *parsed;
     } else {
         fail("expected a status (such as -50150 or \"0xC000026C\"), found " + typeName());

@@ -43,6 +43,7 @@ public:
 
     bool isString() const { return value_->is_string(); }
     bool isObject() const { return value_->is_object(); }
+    bool isArray() const { return value_->is_array(); }
     bool isNull() const { return value_->is_null(); }
 
     std::string text() const;
@@ -68,6 +69,11 @@ private:
     std::shared_ptr<const std::string> file_;
     std::string pointer_;
 };
+
+// One step of a JSON pointer: "~" and "/" escaped as the pointer syntax
+// wants, control characters written out as \uXXXX so that a message never
+// carries them raw.
+std::string escapePointerToken(const std::string& token);
 
 // Parses a number text as the scenario format accepts it; nullopt when it is not one.
 std::optional<int64_t> parseNumberText(const std::string& text);

@@ -1,6 +1,10 @@
 #include "lab.h"
 
 #include <algorithm>
+#include <cstdlib>
+
+#include <fmt/format.h>
+#include <iostream>
 
 #include "findings.h"
 #include "runner.h"
@@ -22,9 +26,12 @@ ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
     ScenarioResult result;
     result.file = scenario.file;
     result.scenario = scenario;
-    Progress progress(stdout);
+    Progress progress(stderr, Progress::styleFor(std::getenv("TERM")));
+    std::string prefix;
+    if (options.scenarioCount > 1) prefix = fmt::format("[{}/{}] {}", options.scenarioNumber, options.scenarioCount, result.file);
     try {
-        World world(*result.scenario, options.modulePath, options.progress ? &progress : nullptr);
+        Progress* display = options.progressDisplay != nullptr ? options.progressDisplay : &progress;
+        World world(*result.scenario, options.modulePath, options.progress ? display : nullptr, prefix);
         std::vector<StepRecord> steps = runSteps(*result.scenario, world);
         result.record = takeRecord(*result.scenario, world, std::move(steps));
         result.record.findings = findFindings(result.record);
@@ -33,6 +40,9 @@ ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
         result.invalid = error.what();
     } catch (const LabError& error) {
         result.labError = error.what();
+    } catch (const std::exception& error) {
+        // Whatever went wrong stays this scenario's: the others still run and report.
+        result.labError = std::string("the lab failed: ") + error.what();
     }
     progress.clear();
     return result;
@@ -40,14 +50,20 @@ ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options)
 
 ScenarioResult runScenarioFile(const std::filesystem::path& path, const RunOptions& options)
 {
+    ScenarioResult result;
+    result.file = path.string();
     try {
+        if (path == kStandardInput) {
+            result.file = "(standard input)";
+            return runScenario(loadScenarioStream(std::cin, result.file, std::filesystem::current_path()), options);
+        }
         return runScenario(loadScenarioFile(path), options);
     } catch (const ScenarioError& error) {
-        ScenarioResult result;
-        result.file = path.string();
         result.invalid = error.what();
-        return result;
+    } catch (const std::exception& error) {
+        result.labError = std::string("the lab failed: ") + error.what();
     }
+    return result;
 }
 
 int combinedExitCode(const std::vector<ScenarioResult>& results)

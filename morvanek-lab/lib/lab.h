@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "expectations.h"
+#include "progress.h"
 #include "runRecord.h"
 #include "scenario.h"
 
@@ -28,7 +29,10 @@ struct MemoryRange {
 
 struct RunOptions {
     std::string modulePath;  // empty: the module built beside the lab
-    bool progress = false;   // a progress line on standard output (a terminal)
+    bool progress = false;   // a progress line on standard error (a terminal)
+    size_t scenarioNumber = 1;  // of scenarioCount, for the progress line
+    size_t scenarioCount = 1;
+    Progress* progressDisplay = nullptr;  // where progress goes instead of standard error (tests)
     bool trace = false;      // the request trace, for people
     std::vector<MemoryRange> memoryRanges;  // shown per device in the report
 };
@@ -45,6 +49,9 @@ struct ScenarioResult {
 };
 
 ScenarioResult runScenario(const Scenario& scenario, const RunOptions& options);
+// "-" reads the scenario from standard input; files it names are then found
+// relative to the current folder.
+constexpr const char* kStandardInput = "-";
 ScenarioResult runScenarioFile(const std::filesystem::path& path, const RunOptions& options);
 // The worst of the results: a lab error, then an invalid scenario, then a failed expectation.
 int combinedExitCode(const std::vector<ScenarioResult>& results);

@@ -50,8 +50,20 @@ sim::RequestKind requestKind(const JsonNode& node)
 sim::DeviceFaults parseFaults(const JsonNode& node)
 {
     node.allowOnly({"stallRequests", "stallKinds", "readCorruptions", "unplugAtRequest", "refuseOpenStream",
-                    "refuseAllocateBuffer"});
+                    "refuseAllocateBuffer", "failAttributes", "failGetDescriptor"});
     sim::DeviceFaults faults;
+    if (auto list = node.optionalField("failAttributes")) {
+        for (const JsonNode& item : list->itemsOrOne()) {
+            item.allowOnly({"id", "status"});
+            JsonNode id = item.field("id");
+            uint64_t attribute = id.unsignedNumber(0xFFFFFFFF);
+            if (attribute != 1 && attribute != 2 && attribute != 21)
+                id.fail(fmt::format("the host reads attributes 1 (vendor ID), 2 (product ID) and 21 of a device; not {}",
+                                    attribute));
+            faults.attributeFailures[static_cast<uint32_t>(attribute)] = failureStatus(item.field("status"));
+        }
+    }
+    if (auto status = node.optionalField("failGetDescriptor")) faults.descriptorFailure = failureStatus(*status);
     if (auto list = node.optionalField("stallRequests")) {
         for (const JsonNode& item : list->itemsOrOne()) {
             uint64_t number = item.unsignedNumber(1000000000);

@@ -1,10 +1,10 @@
 // The world's parts of a scenario: host, registry, drives and file faults.
 #include <algorithm>
 #include <cctype>
-#include <cstring>
 #include <fstream>
 #include <set>
 #include <sstream>
+#include <string_view>
 
 #include <fmt/format.h>
 
@@ -80,7 +80,14 @@ RegistryValuePlan parseRegistryValue(const std::string& name, const JsonNode& no
     return value;
 }
 
-// Drive-relative path of a file: "WINDOWS\system32\x.bin".
+// The longest name one folder entry may have on the host (and on NTFS, in UTF-16 units).
+constexpr size_t kMaxNameBytes = 255;
+// Room for the temporary folder in front: the host's paths stop at 4096 bytes.
+constexpr size_t kMaxDrivePathBytes = 2048;
+
+// Drive-relative path of a file: "WINDOWS\system32\x.bin". Refuses any name
+// that the drive's folder could not hold, or that no Windows path can name,
+// so that a scenario fails here and not halfway through its run.
 std::string driveRelativePath(const JsonNode& node, const std::string& raw)
 {
     std::string path;
@@ -89,15 +96,21 @@ std::string driveRelativePath(const JsonNode& node, const std::string& raw)
     if (path.size() >= 2 && path[1] == ':')
         node.fail("a file name inside a drive is given without its drive letter (\"WINDOWS\\\\system32\\\\...\")");
     if (path.empty()) node.fail("empty file name");
+    if (path.size() > kMaxDrivePathBytes)
+        node.fail(fmt::format("a path of {} bytes; the lab takes paths of at most {} bytes inside a drive", path.size(),
+                              kMaxDrivePathBytes));
     std::stringstream parts(path);
     std::string part;
     while (std::getline(parts, part, '\\')) {
         if (part.empty() || part == "." || part == "..") node.fail("a file name may not contain empty, \".\" or \"..\" parts");
-        // What neither Windows nor the host's file system could hold as a name.
-        if (part.size() > 255) node.fail("a part of a file name is longer than 255 bytes");
+        if (part.size() > kMaxNameBytes)
+            node.fail(fmt::format("the name \"{}...\" has {} bytes; a file or folder name has at most {}",
+                                  part.substr(0, 16), part.size(), kMaxNameBytes));
         for (char c : part) {
-            if (static_cast<unsigned char>(c) < 0x20 || std::strchr("<>:\"|?*", c) != nullptr)
-                node.fail("a file name may not contain control characters or any of < > : \" | ? *");
+            if (static_cast<unsigned char>(c) < 0x20)
+                node.fail(fmt::format("a file name may not hold the control character 0x{:02X}", static_cast<int>(c)));
+            if (std::string_view(":*?\"<>|").find(c) != std::string_view::npos)
+                node.fail(fmt::format("a file name may not hold '{}' (none of : * ? \" < > | can be in a Windows name)", c));
         }
     }
     return path;
@@ -205,7 +218,8 @@ std::string kernelKeyPath(const JsonNode& node)
 HostPlan parseHost(const JsonNode& node)
 {
     node.allowOnly({"ready", "deviceTree", "failAllocations", "failAllAllocations", "registrationFailure",
-                    "unregistrationFailure"});
+                    "unregistrationFailure", "failCreateQuery", "failSetAttribute", "failFindDevices",
+                    "failAddListener"});
     HostPlan host;
     if (auto ready = node.optionalField("ready")) host.ready = ready->flag();
     if (auto tree = node.optionalField("deviceTree")) host.deviceTree = tree->flag();
@@ -225,6 +239,10 @@ HostPlan parseHost(const JsonNode& node)
         host.unregistrationFailure = status->status();
         if (host.unregistrationFailure >= 0) status->fail("an unregistration failure is a negative status");
     }
+    if (auto calls = node.optionalField("failCreateQuery")) host.failCreateQuery = parseCallFailures(*calls, false);
+    if (auto calls = node.optionalField("failSetAttribute")) host.failSetAttribute = parseCallFailures(*calls, false);
+    if (auto calls = node.optionalField("failFindDevices")) host.failFindDevices = parseCallFailures(*calls, false);
+    if (auto calls = node.optionalField("failAddListener")) host.failAddListener = parseCallFailures(*calls, false);
     return host;
 }
 
@@ -307,21 +325,40 @@ std::vector<DrivePlan> parseDrives(const JsonNode& node, const std::filesystem::
     return drives;
 }
 
+std::string dosFilePath(const JsonNode& node)
+{
+    std::string path = node.text();
+    if (path.size() < 3 || !std::isalpha(static_cast<unsigned char>(path[0])) || path[1] != ':' ||
+        (path[2] != '\\' && path[2] != '/'))
+        node.fail(fmt::format("\"{}\" is not a DOS path with its drive letter, such as \"C:\\\\WINDOWS\\\\x.bin\"", path));
+    std::string letter(1, static_cast<char>(std::toupper(static_cast<unsigned char>(path[0]))));
+    return letter + ":\\" + driveRelativePath(node, path.substr(3));
+}
+
 FileFaultPlan parseFileFaults(const JsonNode& node)
 {
-    node.allowOnly({"failReads", "failRead", "failSizeQuery", "failSetPosition"});
+    node.allowOnly({"failReads", "failRead", "failSizeQuery", "failSetPosition", "failOpen"});
     FileFaultPlan faults;
-    if (auto status = node.optionalField("failReads")) faults.everyRead = status->status();
+    if (auto status = node.optionalField("failReads")) faults.everyRead = failureStatus(*status);
     if (auto reads = node.optionalField("failRead")) {
         for (const JsonNode& item : reads->itemsOrOne()) {
             item.allowOnly({"number", "status"});
             uint64_t number = item.field("number").unsignedNumber(1000000);
             if (number == 0) item.field("number").fail("reads count from 1");
-            faults.readNumbers.emplace_back(static_cast<unsigned>(number), item.field("status").status());
+            faults.readNumbers.emplace_back(static_cast<unsigned>(number), failureStatus(item.field("status")));
         }
     }
-    if (auto status = node.optionalField("failSizeQuery")) faults.sizeQuery = status->status();
-    if (auto status = node.optionalField("failSetPosition")) faults.setPosition = status->status();
+    if (auto failures = node.optionalField("failSizeQuery")) {
+        for (CallFailurePlan& failure : parseCallFailures(*failures, true)) {
+            if (failure.number == 0 && !failure.file) {
+                faults.sizeQuery = failure.status;
+            } else {
+                faults.sizeQueries.push_back(failure);
+            }
+        }
+    }
+    if (auto status = node.optionalField("failSetPosition")) faults.setPosition = failureStatus(*status);
+    if (auto failures = node.optionalField("failOpen")) faults.opens = parseCallFailures(*failures, true);
     return faults;
 }
 

@@ -1,5 +1,7 @@
 #include "runObserver.h"
 
+#include <filesystem>
+
 #include <fmt/format.h>
 
 #include "sim/kernel/fileSim.h"
@@ -62,35 +64,75 @@ void RunObserver::onRequest(int index, const sim::PhysicalDevice& device, const 
         if (stored != record.data)
             watched.writesNotTaken.push_back({record.sequence, update, record.wIndex, record.data, stored});
     }
-    if (progress_ != nullptr) showProgress(index, device, record);
+    if (progress_ != nullptr) {
+        countProgress(watched, update, device, record);
+        showProgress(watched);
+    }
 }
 
-// Blocks programmed of the pages erased in this update: each erased page takes one block.
-void RunObserver::showProgress(int index, const sim::PhysicalDevice& device, const sim::RequestRecord& latest)
+// Where an update stands, counted as its requests go by, with totals taken
+// from the size of the image the update opened.
+void RunObserver::countProgress(Watched& watched, int update, const sim::PhysicalDevice& device,
+                                const sim::RequestRecord& record)
 {
-    const Watched& watched = devices_[static_cast<size_t>(index)];
+    UpdateProgress& progress = watched.progress;
+    if (progress.update != update) {
+        progress = UpdateProgress{};
+        progress.update = update;
+    }
     const sim::LoaderFlashLayout* layout = device.layout();
-    if (layout == nullptr) return;
-    int update = watched.updateOf.back();
-    size_t erased = 0;
-    size_t written = 0;
-    auto count = [&](const sim::RequestRecord& request) {
-        if (request.outcome < 0) return;
-        if (request.kind == sim::RequestKind::Erase) ++erased;
-        bool blockStart = ((request.wIndex - layout->firmwareBase) & 0x1FF) == 0;
-        if (request.kind == sim::RequestKind::Write && blockStart && request.wIndex < layout->identityPage) ++written;
-    };
-    // The request being observed is not in the trace yet.
-    for (size_t i = 0; i < device.trace.size() && i < watched.updateOf.size(); ++i) {
-        if (watched.updateOf[i] == update) count(device.trace[i]);
+    if (layout == nullptr || record.outcome < 0) return;
+    if (record.kind == sim::RequestKind::Erase) {
+        if (progress.erased == 0) imageTotals(progress, *layout);
+        ++progress.erased;
+        progress.phase = "erasing page";
+        progress.done = progress.erased;
+        progress.total = progress.pages;
+    } else if (record.kind == sim::RequestKind::Write && record.wIndex == layout->firmwareBase + 6 && record.length == 2 &&
+               progress.erased != 0 && progress.written == progress.blocks) {
+        progress.phase = "completion marker";
+        progress.total = 0;
+    } else if (record.kind == sim::RequestKind::Write && record.wIndex < layout->identityPage && progress.erased != 0) {
+        ++progress.written;
+        progress.phase = "programming block";
+        progress.done = progress.written;
+        progress.total = progress.blocks;
+    } else if (record.kind == sim::RequestKind::Read && progress.written != 0) {
+        progress.phase = "verifying block";
+    } else if (record.kind == sim::RequestKind::Restart) {
+        progress.phase = "restart";
+        progress.total = 0;
+    } else if (progress.erased == 0) {
+        progress.phase = "identity check";
+        progress.total = 0;
     }
-    count(latest);
-    if (erased == 0) return;
-    if (written == 0) {
-        progress_->show(fmt::format("  erasing {}: {} page(s)", watched.name, erased));
-    } else {
-        progress_->show(fmt::format("  programming {}: block {} of {}", watched.name, written, erased));
+}
+
+void RunObserver::imageTotals(UpdateProgress& progress, const sim::LoaderFlashLayout& layout)
+{
+    // The image the update opened is the last file opened before its first erase.
+    const auto& opens = sim::kernel::files().opens();
+    for (auto it = opens.rbegin(); it != opens.rend(); ++it) {
+        if (it->status < 0 || it->hostPath.empty()) continue;
+        std::error_code error;
+        uintmax_t size = std::filesystem::file_size(it->hostPath, error);
+        if (error || size == 0) return;
+        uintmax_t first = layout.firmwareBase >> 9;
+        uintmax_t last = (layout.firmwareBase + size - 1) >> 9;
+        progress.pages = static_cast<size_t>(last - first + 1);
+        progress.blocks = static_cast<size_t>((size + 511) / 512);
+        return;
     }
+}
+
+void RunObserver::showProgress(const Watched& watched)
+{
+    const UpdateProgress& progress = watched.progress;
+    if (progress.phase.empty() || !progress_->due()) return;
+    std::string line = prefix_.empty() ? "" : prefix_ + " ";
+    line += fmt::format("{}: {}", watched.name, progress.phase);
+    if (progress.total != 0) line += fmt::format(" {} of {}", progress.done, progress.total);
+    progress_->show(line);
 }
 
 }  // namespace lab

@@ -4,6 +4,8 @@
 #pragma once
 
 #include <memory>
+#include <string>
+#include <utility>
 #include <vector>
 
 #include "progress.h"
@@ -14,7 +16,8 @@ namespace lab {
 
 class RunObserver {
 public:
-    explicit RunObserver(Progress* progress) : progress_(progress) {}
+    // prefix: put before each progress line, such as "[2/5] file.json".
+    RunObserver(Progress* progress, std::string prefix) : progress_(progress), prefix_(std::move(prefix)) {}
 
     // Starts watching a device; its index is its place in the scenario.
     void watch(sim::PhysicalDevice& device, int index);
@@ -29,8 +32,20 @@ public:
     const std::vector<WriteNotTaken>& writesNotTaken(int device) const { return devices_.at(device).writesNotTaken; }
 
 private:
+    struct UpdateProgress {
+        int update = -1;
+        size_t erased = 0;
+        size_t written = 0;
+        size_t pages = 0;   // totals: 0 while unknown
+        size_t blocks = 0;
+        std::string phase;  // what the update does now
+        size_t done = 0;    // of total, in this phase
+        size_t total = 0;
+    };
+
     struct Watched {
         std::string name;
+        UpdateProgress progress;
         const sim::EnumeratedDevice* enumeration = nullptr;
         int updates = 0;
         std::vector<int> updateOf;
@@ -39,9 +54,13 @@ private:
 
     void onRequest(int index, const sim::PhysicalDevice& device, const sim::RequestRecord& record);
     void catchUp();
-    void showProgress(int index, const sim::PhysicalDevice& device, const sim::RequestRecord& latest);
+    void countProgress(Watched& watched, int update, const sim::PhysicalDevice& device,
+                       const sim::RequestRecord& record);
+    static void imageTotals(UpdateProgress& progress, const sim::LoaderFlashLayout& layout);
+    void showProgress(const Watched& watched);
 
     Progress* progress_;
+    std::string prefix_;
     std::vector<Watched> devices_;
     Owner last_;
     std::vector<Owner> logOwners_;

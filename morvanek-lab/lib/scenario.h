@@ -12,6 +12,15 @@
 
 namespace lab {
 
+// A failure injected into one kind of call: the Nth call, counted from 1 over
+// the run, or every call when the number is 0.
+struct CallFailurePlan {
+    std::string pointer;  // where it stands in the scenario, for messages
+    uint64_t number = 0;
+    int32_t status = 0;
+    std::optional<std::string> file;  // file calls: only those of this DOS path ("C:\...")
+};
+
 struct HostPlan {
     bool ready = true;
     bool deviceTree = true;
@@ -19,6 +28,11 @@ struct HostPlan {
     bool failAllAllocations = false;
     int32_t registrationFailure = 0;
     int32_t unregistrationFailure = 0;
+    // The device tree's calls.
+    std::vector<CallFailurePlan> failCreateQuery;
+    std::vector<CallFailurePlan> failSetAttribute;
+    std::vector<CallFailurePlan> failFindDevices;
+    std::vector<CallFailurePlan> failAddListener;
 };
 
 struct RegistryValuePlan {
@@ -59,8 +73,10 @@ struct DrivePlan {
 struct FileFaultPlan {
     int32_t everyRead = 0;
     std::vector<std::pair<unsigned, int32_t>> readNumbers;
-    int32_t sizeQuery = 0;
+    int32_t sizeQuery = 0;  // every size query of every file
     int32_t setPosition = 0;
+    std::vector<CallFailurePlan> opens;
+    std::vector<CallFailurePlan> sizeQueries;
 };
 
 struct DevicePlan {

@@ -25,6 +25,17 @@ private:
     std::string problem_;
 };
 
+// A command that cannot do what it was asked, with the exit code that says
+// so; the command line reports it as text or, with --json, as JSON.
+class CommandError : public std::runtime_error {
+public:
+    CommandError(int exitCode, const std::string& what) : std::runtime_error(what), exitCode_(exitCode) {}
+    int exitCode() const { return exitCode_; }
+
+private:
+    int exitCode_;
+};
+
 // Something went wrong in the lab itself, not in the scenario: the module
 // cannot be loaded, a temporary folder cannot be made.
 class LabError : public std::runtime_error {

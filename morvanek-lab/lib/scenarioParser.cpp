@@ -1,123 +1,35 @@
 #include "scenarioParser.h"
 
 #include <fstream>
-#include <memory>
-#include <set>
-#include <sstream>
+#include <istream>
 
 #include <fmt/format.h>
 
+#include "jsonText.h"
 #include "parseParts.h"
 
 namespace lab {
 
 namespace {
 
-// nlohmann reports a byte offset; people want a line and a column.
-std::string lineAndColumn(const std::string& text, size_t byte)
+// A stream's text, stopping one byte past what the lab takes so that the
+// limit can be told apart from a file that fits it.
+std::string readAtMost(std::istream& in, size_t limit)
 {
-    size_t line = 1;
-    size_t column = 1;
-    for (size_t i = 0; i + 1 < byte && i < text.size(); ++i) {
-        if (text[i] == '\n') {
-            ++line;
-            column = 1;
-        } else {
-            ++column;
-        }
+    std::string text;
+    char buffer[65536];
+    while (text.size() < limit && in.read(buffer, sizeof buffer).gcount() > 0) {
+        text.append(buffer, static_cast<size_t>(in.gcount()));
     }
-    return fmt::format("line {}, column {}", line, column);
+    if (text.size() > limit) text.resize(limit);
+    return text;
 }
-
-// The parser's message carries its own position prefix; keep only what is wrong.
-std::string syntaxProblem(const nlohmann::json::parse_error& error)
-{
-    std::string what = error.what();
-    size_t colon = what.rfind(": ");
-    return colon == std::string::npos ? what : "JSON syntax error: " + what.substr(colon + 2);
-}
-
-// Duplicate keys would silently win or lose; a scenario with one is refused,
-// at the place of the second one.
-class DuplicateKeyCheck {
-public:
-    bool operator()(nlohmann::json::parse_event_t event, const nlohmann::json& parsed)
-    {
-        using Event = nlohmann::json::parse_event_t;
-        switch (event) {
-        case Event::object_start:
-        case Event::array_start:
-            frames_.push_back({event == Event::array_start, 0, "", {}});
-            break;
-        case Event::key:
-            frames_.back().key = parsed.get<std::string>();
-            if (!frames_.back().keys.insert(frames_.back().key).second && duplicate_.empty()) {
-                duplicate_ = frames_.back().key;
-                place_ = pointer();
-            }
-            break;
-        case Event::object_end:
-        case Event::array_end:
-            frames_.pop_back();
-            elementDone();
-            break;
-        case Event::value:
-            elementDone();
-            break;
-        }
-        return true;
-    }
-
-    std::string duplicate_;
-    std::string place_;
-
-    // Where the parser stands now, as a JSON pointer.
-    std::string pointer() const
-    {
-        std::string path;
-        for (const Frame& frame : frames_) {
-            std::string token = frame.isArray ? std::to_string(frame.index) : frame.key;
-            std::string escaped;
-            for (char c : token) escaped += c == '~' ? std::string("~0") : c == '/' ? std::string("~1") : std::string(1, c);
-            path += "/" + escaped;
-        }
-        return path;
-    }
-
-private:
-    struct Frame {
-        bool isArray;
-        size_t index;
-        std::string key;
-        std::set<std::string> keys;
-    };
-
-    void elementDone()
-    {
-        if (!frames_.empty() && frames_.back().isArray) ++frames_.back().index;
-    }
-
-    std::vector<Frame> frames_;
-};
 
 }  // namespace
 
 Scenario parseScenarioText(const std::string& text, const std::string& fileName, const std::filesystem::path& directory)
 {
-    nlohmann::json document;
-    auto check = std::make_shared<DuplicateKeyCheck>();
-    try {
-        document = nlohmann::json::parse(
-            text, [check](int, nlohmann::json::parse_event_t event, nlohmann::json& parsed) { return (*check)(event, parsed); });
-    } catch (const nlohmann::json::parse_error& error) {
-        throw ScenarioError(fileName, lineAndColumn(text, error.byte), syntaxProblem(error));
-    } catch (const nlohmann::json::out_of_range&) {
-        // Valid JSON, such as 1e999, that no double can hold.
-        throw ScenarioError(fileName, check->pointer(), "a number too large to read");
-    }
-    if (!check->duplicate_.empty())
-        throw ScenarioError(fileName, check->place_, fmt::format("the field \"{}\" appears twice in one object", check->duplicate_));
-
+    nlohmann::json document = readJsonText(text, fileName);
     JsonNode root(document, fileName);
     root.allowOnly({"description", "host", "registry", "drives", "fileFaults", "devices", "steps", "expect"});
 
@@ -144,17 +56,28 @@ Scenario parseScenarioText(const std::string& text, const std::string& fileName,
 
 Scenario loadScenarioFile(const std::filesystem::path& path)
 {
+    std::error_code error;
+    if (std::filesystem::is_directory(path, error)) throw ScenarioError(path.string(), "", "is a directory, not a scenario file");
     std::ifstream in(path, std::ios::binary);
     if (!in) {
-        std::error_code error;
         bool exists = std::filesystem::exists(path, error);
         throw ScenarioError(path.string(), "", exists ? "cannot be read" : "no such file");
     }
-    std::ostringstream text;
-    text << in.rdbuf();
+    // Refused before it is read: a file past the limit could take all memory.
+    uintmax_t size = std::filesystem::file_size(path, error);
+    if (!error && size > kMaxScenarioBytes)
+        throw ScenarioError(path.string(), "",
+                            fmt::format("{} bytes; the lab takes scenarios of at most {} MiB", size,
+                                        kMaxScenarioBytes / (1024 * 1024)));
+    std::string text = readAtMost(in, kMaxScenarioBytes + 1);
     std::filesystem::path directory = path.parent_path();
     if (directory.empty()) directory = ".";
-    return parseScenarioText(text.str(), path.string(), directory);
+    return parseScenarioText(text, path.string(), directory);
+}
+
+Scenario loadScenarioStream(std::istream& in, const std::string& name, const std::filesystem::path& directory)
+{
+    return parseScenarioText(readAtMost(in, kMaxScenarioBytes + 1), name, directory);
 }
 
 }  // namespace lab

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <filesystem>
+#include <iosfwd>
 #include <string>
 
 #include "scenario.h"
@@ -10,6 +11,9 @@
 namespace lab {
 
 Scenario loadScenarioFile(const std::filesystem::path& path);
+// A scenario read from a stream such as standard input, named `name` in
+// messages; files it names are found relative to `directory`.
+Scenario loadScenarioStream(std::istream& in, const std::string& name, const std::filesystem::path& directory);
 // The text of a scenario; files it names are found relative to `directory`.
 Scenario parseScenarioText(const std::string& text, const std::string& fileName,
                            const std::filesystem::path& directory);

@@ -44,8 +44,9 @@ std::optional<std::filesystem::path> findIgnoringCase(const std::filesystem::pat
 
 }  // namespace
 
-World::World(const Scenario& scenario, const std::string& modulePath, Progress* progress)
-    : scenario_(scenario), observer_(progress)
+World::World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
+             const std::string& progressPrefix)
+    : scenario_(scenario), observer_(progress, progressPrefix)
 {
     sim::Host::get().reset();
     sim::kernel::reset();
@@ -54,6 +55,20 @@ World::World(const Scenario& scenario, const std::string& modulePath, Progress* 
     host.setTreePresent(scenario.host.deviceTree);
     host.registrationFailure = scenario.host.registrationFailure;
     host.unregistrationFailure = scenario.host.unregistrationFailure;
+    sim::TreeFaults& treeFaults = host.tree()->faults;
+    auto arm = [](sim::CallFailures& calls, const std::vector<CallFailurePlan>& plans) {
+        for (const CallFailurePlan& plan : plans) {
+            if (plan.number == 0) {
+                calls.everyCall = plan.status;
+            } else {
+                calls.byNumber[static_cast<int>(plan.number)] = plan.status;
+            }
+        }
+    };
+    arm(treeFaults.createQuery, scenario.host.failCreateQuery);
+    arm(treeFaults.setAttribute, scenario.host.failSetAttribute);
+    arm(treeFaults.findDevices, scenario.host.failFindDevices);
+    arm(treeFaults.addListener, scenario.host.failAddListener);
     try {
         buildDrives();
         buildRegistry();
@@ -119,6 +134,21 @@ void World::buildDrives()
     for (const auto& [number, status] : faults.readNumbers) files.failReadNumber(number, status);
     if (faults.sizeQuery != 0) files.failSizeQuery(faults.sizeQuery);
     if (faults.setPosition != 0) files.failSetPosition(faults.setPosition);
+    for (const CallFailurePlan& failure : faults.opens)
+        files.failOpenNumber(static_cast<unsigned>(failure.number), failure.status, faultFile(failure));
+    for (const CallFailurePlan& failure : faults.sizeQueries)
+        files.failSizeQueryNumber(static_cast<unsigned>(failure.number), failure.status, faultFile(failure));
+}
+
+std::filesystem::path World::faultFile(const CallFailurePlan& failure) const
+{
+    if (!failure.file) return {};
+    std::optional<std::filesystem::path> path = hostPath(*failure.file);
+    if (!path) {
+        throw ScenarioError(scenario_.file, failure.pointer + "/file",
+                            fmt::format("there is no file {} in the scenario's drives", *failure.file));
+    }
+    return *path;
 }
 
 void World::buildRegistry()

@@ -20,7 +20,8 @@ namespace lab {
 class World {
 public:
     // Throws LabError when the module cannot be loaded or a folder not made.
-    World(const Scenario& scenario, const std::string& modulePath, Progress* progress);
+    World(const Scenario& scenario, const std::string& modulePath, Progress* progress,
+          const std::string& progressPrefix = {});
     ~World();
     World(const World&) = delete;
     World& operator=(const World&) = delete;
@@ -42,6 +43,8 @@ private:
     void buildDrives();
     void buildRegistry();
     void buildDevices();
+    // The host file a file fault names; empty when it names none.
+    std::filesystem::path faultFile(const CallFailurePlan& failure) const;
 
     const Scenario& scenario_;
     RunObserver observer_;

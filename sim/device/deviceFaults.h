@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <set>
 #include <vector>
@@ -20,6 +21,13 @@ struct ReadCorruption {
 };
 
 struct DeviceFaults {
+    // What the host reports about the device: attribute reads (1 vendor ID,
+    // 2 product ID, 21 the host's own) that fail with a status, and a
+    // descriptor read that fails (0: it does not). A failed attribute reads
+    // as 0xFFFFFFFF, so attribute 21, read with no status, bars the update.
+    std::map<uint32_t, int32_t> attributeFailures;
+    int32_t descriptorFailure = 0;
+
     // Request numbers count every request the device is handed, from 1.
     std::set<uint64_t> stallRequests;
     std::set<RequestKind> stallKinds;

@@ -16,15 +16,21 @@ EnumeratedDevice::~EnumeratedDevice()
 
 uint32_t EnumeratedDevice::getAttribute(uint32_t id, tStatus* status)
 {
-    if (!gone_) return UsbDeviceSim::getAttribute(id, status);
-    if (status != nullptr) setFailure(*status, kHostDeviceGone);
+    if (status != nullptr && *status < 0) return 0;
+    auto injected = hardware_->faults.attributeFailures.find(id);
+    if (!gone_ && injected == hardware_->faults.attributeFailures.end()) return UsbDeviceSim::getAttribute(id, status);
+    ++attributeReads;
+    if (status != nullptr) setFailure(*status, gone_ ? kHostDeviceGone : injected->second);
     return 0xFFFFFFFF;
 }
 
 void EnumeratedDevice::getDescriptor(nQVKORD100::tUSBDeviceDescriptorProxy* proxy, tStatus& status)
 {
-    if (!gone_) return UsbDeviceSim::getDescriptor(proxy, status);
-    setFailure(status, kHostDeviceGone);
+    tStatus injected = hardware_->faults.descriptorFailure;
+    if (!gone_ && injected >= 0) return UsbDeviceSim::getDescriptor(proxy, status);
+    if (status < 0) return;
+    ++descriptorReads;
+    setFailure(status, gone_ ? kHostDeviceGone : injected);
 }
 
 }  // namespace sim

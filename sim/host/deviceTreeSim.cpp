@@ -18,9 +18,10 @@ public:
     Query(DeviceTreeSim& tree, uint32_t id) : tree_(tree), id_(id) {}
     void setAttribute(uint32_t id, const void* value, tStatus& status) override
     {
+        tStatus injected = tree_.faults.setAttribute.statusFor(++tree_.setAttributeCalls_);
         if (status < 0) return;
-        if (tree_.faults.setAttribute || value == nullptr) {
-            setFailure(status, kHostFailure);
+        if (injected < 0 || value == nullptr) {
+            setFailure(status, injected < 0 ? injected : kHostFailure);
             return;
         }
         attributes[id] = *static_cast<const uint32_t*>(value);
@@ -43,10 +44,10 @@ DeviceTreeSim::~DeviceTreeSim() = default;
 
 void DeviceTreeSim::addListener(ListenerRecord* record, tStatus& status)
 {
-    ++addListenerCalls_;
+    tStatus injected = faults.addListener.statusFor(++addListenerCalls_);
     if (status < 0) return;
-    if (faults.addListenerCalls.count(addListenerCalls_) != 0) {
-        setFailure(status, kHostFailure);
+    if (injected < 0) {
+        setFailure(status, injected);
         return;
     }
     Host& host = Host::get();
@@ -81,7 +82,7 @@ void DeviceTreeSim::removeListener(ListenerRecord* record, tStatus* status)
 
 DeviceQuery* DeviceTreeSim::createQuery()
 {
-    if (faults.createQuery) return nullptr;
+    if (faults.createQuery.statusFor(++createQueryCalls_) < 0) return nullptr;
     queries_.push_back(std::make_unique<Query>(*this, nextQueryId_++));
     return queries_.back().get();
 }
@@ -104,6 +105,7 @@ void DeviceTreeSim::releaseQuery(DeviceQuery** query)
 void DeviceTreeSim::findDevices(DeviceList* list, uint32_t selector, DeviceQuery* query, uint32_t flags,
                                 tStatus& status)
 {
+    tStatus injected = faults.findDevices.statusFor(++findDevicesCalls_);
     if (status < 0) return;
     if (list == nullptr) {
         setFailure(status, kHostBadArgument);
@@ -122,8 +124,8 @@ void DeviceTreeSim::findDevices(DeviceList* list, uint32_t selector, DeviceQuery
     tStatus allocationStatus = 0;
     list->devices = static_cast<UsbDevice**>(
         Host::get().allocator.allocate(sizeof(UsbDevice*) * (found.empty() ? 1 : found.size()), &allocationStatus));
-    if (faults.findDevices || allocationStatus < 0) {
-        setFailure(status, allocationStatus < 0 ? allocationStatus : kHostFailure);
+    if (injected < 0 || allocationStatus < 0) {
+        setFailure(status, allocationStatus < 0 ? allocationStatus : injected);
         return;
     }
     for (size_t i = 0; i < found.size(); ++i) list->devices[i] = found[i];

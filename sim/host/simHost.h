@@ -67,12 +67,26 @@ private:
 
 class UsbDeviceSim;
 
-// Which operations of the tree fail. Call numbers count from 1.
+// A call told to fail: every call with one status, or chosen calls (numbered
+// from 1 over the tree's life, calls with a failed incoming status included)
+// each with its own.
+struct CallFailures {
+    tStatus everyCall = 0;
+    std::map<int, tStatus> byNumber;
+
+    tStatus statusFor(int call) const
+    {
+        auto it = byNumber.find(call);
+        return it != byNumber.end() ? it->second : everyCall;
+    }
+};
+
+// Which operations of the tree fail.
 struct TreeFaults {
-    bool createQuery = false;
-    bool setAttribute = false;
-    bool findDevices = false;
-    std::set<int> addListenerCalls;
+    CallFailures createQuery;  // it has no status to fail: a failing call returns no query
+    CallFailures setAttribute; // on any query of the tree
+    CallFailures findDevices;
+    CallFailures addListener;
     bool removeListener = false;
 };
 
@@ -106,6 +120,9 @@ public:
     std::vector<UsbDeviceSim*> allDevices() const;
     size_t liveQueries() const;
     size_t liveListeners() const { return listeners_.size(); }
+    int createQueryCalls() const { return createQueryCalls_; }
+    int setAttributeCalls() const { return setAttributeCalls_; }
+    int findDevicesCalls() const { return findDevicesCalls_; }
     int addListenerCalls() const { return addListenerCalls_; }
     int removeListenerCalls() const { return removeListenerCalls_; }
     std::vector<std::string> describeLeftovers() const;
@@ -123,6 +140,9 @@ private:
     std::vector<ListenerRecord*> listeners_;
     std::deque<Event> pending_;
     uint32_t nextQueryId_ = 0x51;
+    int createQueryCalls_ = 0;
+    int setAttributeCalls_ = 0;
+    int findDevicesCalls_ = 0;
     int addListenerCalls_ = 0;
     int removeListenerCalls_ = 0;
     bool delivering_ = false;

@@ -104,6 +104,8 @@ NTSTATUS openResolvedFile(const std::u16string& name, uint32_t shareAccess, File
 {
     FileWorld& world = fileWorld();
     DosPathResolution resolution = resolveDosPath(name, world.drives);
+    NTSTATUS injected = world.faults.opens.onCall(resolution.status < 0 ? std::filesystem::path() : resolution.hostPath);
+    if (injected < 0) return injected;
     if (resolution.status < 0) return resolution.status;
     record.hostPath = resolution.hostPath;
     if (resolution.isDirectory) return fileStatus::fileIsADirectory;

@@ -41,6 +41,8 @@ NTSTATUS queryStandardInformation(const OpenFile& file, void* information, uint3
 {
     if (length < sizeof(FILE_STANDARD_INFORMATION)) return fileStatus::infoLengthMismatch;
     if (fileWorld().faults.sizeQuery < 0) return fileWorld().faults.sizeQuery;
+    NTSTATUS injected = fileWorld().faults.sizeQueries.onCall(file.hostPath);
+    if (injected < 0) return injected;
     int64_t size = static_cast<int64_t>(file.bytes.size());
     FILE_STANDARD_INFORMATION standard{};
     standard.AllocationSize.QuadPart = (size + kAllocationUnit - 1) / kAllocationUnit * kAllocationUnit;

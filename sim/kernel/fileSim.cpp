@@ -85,6 +85,16 @@ void FileSystem::failSizeQuery(NTSTATUS status)
     fileWorld().faults.sizeQuery = status;
 }
 
+void FileSystem::failOpenNumber(unsigned nth, NTSTATUS status, const std::filesystem::path& hostFile)
+{
+    fileWorld().faults.opens.add(nth, status, hostFile);
+}
+
+void FileSystem::failSizeQueryNumber(unsigned nth, NTSTATUS status, const std::filesystem::path& hostFile)
+{
+    fileWorld().faults.sizeQueries.add(nth, status, hostFile);
+}
+
 void FileSystem::failSetPosition(NTSTATUS status)
 {
     fileWorld().faults.setPosition = status;

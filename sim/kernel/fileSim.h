@@ -67,6 +67,12 @@ class FileSystem {
     void failReads(NTSTATUS status);
     void failReadNumber(unsigned nth, NTSTATUS status);
     void failSizeQuery(NTSTATUS status);   // FileStandardInformation queries
+    // The Nth open (a well-formed ZwCreateFile) or size query from now fails
+    // with the status: counted over every file, or over hostFile's calls only
+    // when it is given; nth 0: every call. An injected open failure returns
+    // no handle and wins over whatever else the open would meet.
+    void failOpenNumber(unsigned nth, NTSTATUS status, const std::filesystem::path& hostFile = {});
+    void failSizeQueryNumber(unsigned nth, NTSTATUS status, const std::filesystem::path& hostFile = {});
     void failSetPosition(NTSTATUS status); // FilePositionInformation changes
     void clearFaults();
 

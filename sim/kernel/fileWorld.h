@@ -6,6 +6,7 @@
 #include <map>
 #include <vector>
 
+#include "fileCallFaults.h"
 #include "fileSim.h"
 
 namespace sim::kernel {
@@ -22,6 +23,8 @@ struct FileFaults {
     std::map<uint64_t, NTSTATUS> readsByNumber; // by the read count that fails
     NTSTATUS sizeQuery = 0;
     NTSTATUS setPosition = 0;
+    FileCallFaults opens;       // ZwCreateFile calls with a well-formed request
+    FileCallFaults sizeQueries; // FileStandardInformation queries
 };
 
 struct FileWorld {

@@ -144,5 +144,39 @@ TEST_F(OpenTest, AFileHeldOpenByTheModuleOrElsewhereCannotBeOpenedUntilReleased)
     EXPECT_EQ(ZwClose(openOrFail(u"C:\\other.bin")), 0);
 }
 
+// The Nth open of one file, or of any file, fails as told; other opens and
+// later ones are untouched, and a failed open leaves no handle.
+TEST_F(OpenTest, InjectedOpenFailuresHitTheNthOpenOfTheirFileOrOfAnyFile)
+{
+    for (const char* name : {"image.bin", "other.bin"}) writeFile(drive() / name, {});
+    auto opens = [](std::initializer_list<const char16_t*> names) {
+        std::vector<NTSTATUS> statuses;
+        for (const char16_t* name : names) {
+            CreateResult result = create({std::u16string(u"\\??\\C:\\") + name});
+            statuses.push_back(result.status);
+            EXPECT_EQ(result.handle == nullptr, result.status < 0);
+            if (result.status >= 0) {
+                EXPECT_EQ(ZwClose(result.handle), 0);
+            }
+        }
+        return statuses;
+    };
+    const NTSTATUS denied = status::accessDenied;
+    const NTSTATUS missing = status::objectNameNotFound;
+
+    // The second open of image.bin, spelt in any case, counted from now.
+    files().failOpenNumber(2, denied, drive() / "image.bin");
+    EXPECT_EQ(opens({u"image.bin", u"other.bin", u"IMAGE.BIN", u"image.bin"}), (std::vector<NTSTATUS>{0, 0, denied, 0}));
+    // The third open of any file, even one that is not there.
+    files().failOpenNumber(3, denied);
+    EXPECT_EQ(opens({u"other.bin", u"nowhere.bin", u"nowhere.bin", u"image.bin"}),
+              (std::vector<NTSTATUS>{0, missing, denied, 0}));
+    // Every open of one file.
+    files().failOpenNumber(0, denied, drive() / "other.bin");
+    EXPECT_EQ(opens({u"other.bin", u"image.bin", u"other.bin"}), (std::vector<NTSTATUS>{denied, 0, denied}));
+    files().clearFaults();
+    EXPECT_EQ(opens({u"other.bin"}), (std::vector<NTSTATUS>{0}));
+}
+
 }  // namespace
 }  // namespace files_test

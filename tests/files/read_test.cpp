@@ -86,6 +86,30 @@ TEST_F(ReadTest, TheSizeIsReportedOtherInformationIsRefusedAndInjectedFailuresCh
     EXPECT_EQ(read(file_, 4).bytes, slice(50, 4));
 }
 
+TEST_F(ReadTest, InjectedSizeQueryFailuresHitTheNthQueryOfTheirFileOrOfAnyFile)
+{
+    writeFile(drive() / "other.bin", patternBytes(10));
+    HANDLE other = openOrFail(u"C:\\other.bin");
+    auto sizes = [](std::initializer_list<HANDLE> handles) {
+        std::vector<NTSTATUS> statuses;
+        for (HANDLE handle : handles) {
+            FILE_STANDARD_INFORMATION information{};
+            IO_STATUS_BLOCK ioStatus{};
+            statuses.push_back(querySize(handle, information, ioStatus));
+        }
+        return statuses;
+    };
+    const NTSTATUS failed = status::deviceDataError;
+    files().failSizeQueryNumber(2, failed, drive() / "image.bin");
+    EXPECT_EQ(sizes({file_, other, file_, file_}), (std::vector<NTSTATUS>{0, 0, failed, 0}));
+    files().failSizeQueryNumber(2, failed);
+    EXPECT_EQ(sizes({file_, other, file_}), (std::vector<NTSTATUS>{0, failed, 0}));
+    // One named file fails every time while the others answer.
+    files().failSizeQueryNumber(0, failed, drive() / "other.bin");
+    EXPECT_EQ(sizes({other, file_, other}), (std::vector<NTSTATUS>{failed, 0, failed}));
+    EXPECT_EQ(ZwClose(other), 0);
+}
+
 TEST_F(ReadTest, InjectedReadFailuresReadNothingAndKeepThePosition)
 {
     ASSERT_EQ(read(file_, 10).status, 0);  // read numbers count from after this one

@@ -63,9 +63,9 @@ TEST_P(ConstructionFailures, LeaveNothingBehind)
 const ConstructionFailure kConstructionFailures[] = {
     {"NoTable", [](sim::Host& h) { h.allocator.failNth(1); }, -50352, 0, 0},
     {"NoDeviceTree", [](sim::Host& h) { h.setTreePresent(false); }, -50150, 0, 0},
-    {"NoQuery", [](sim::Host& h) { h.tree()->faults.createQuery = true; }, -50352, 0, 0},
-    {"QueryAttributeFails", [](sim::Host& h) { h.tree()->faults.setAttribute = true; }, sim::kHostFailure, 0, 0},
-    {"SearchFails", [](sim::Host& h) { h.tree()->faults.findDevices = true; }, sim::kHostFailure, 0, 0},
+    {"NoQuery", [](sim::Host& h) { h.tree()->faults.createQuery.everyCall = sim::kHostFailure; }, -50352, 0, 0},
+    {"QueryAttributeFails", [](sim::Host& h) { h.tree()->faults.setAttribute.everyCall = -7; }, -7, 0, 0},
+    {"SearchFails", [](sim::Host& h) { h.tree()->faults.findDevices.byNumber[1] = -8; }, -8, 0, 0},
     {"SearchArrayNotAllocated", [](sim::Host& h) { h.allocator.failNth(2); }, sim::kHostAllocationFailed, 0, 0},
     {"NoArrivalRecord", [](sim::Host& h) { h.allocator.failNth(3); }, -50352, 0, 1},
     {"NoRemovalRecord", [](sim::Host& h) { h.allocator.failNth(4); }, -50352, 0, 1},
@@ -73,8 +73,8 @@ const ConstructionFailure kConstructionFailures[] = {
          h.allocator.failNth(3);
          h.allocator.failNth(4);
      }, -50352, 0, 0},
-    {"FirstAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListenerCalls = {1}; }, sim::kHostFailure, 2, 2},
-    {"SecondAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListenerCalls = {2}; }, sim::kHostFailure, 2, 2},
+    {"FirstAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListener.byNumber[1] = -9; }, -9, 2, 2},
+    {"SecondAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListener.byNumber[2] = -10; }, -10, 2, 2},
 };
 
 INSTANTIATE_TEST_SUITE_P(Steps, ConstructionFailures, ::testing::ValuesIn(kConstructionFailures),
@@ -84,7 +84,7 @@ TEST_F(DeviceTable, PresentDevicesAreHandledBeforeAnyListenerExists)
 {
     sim::UsbDeviceSim& first = addDevice(0x5C1D, 0x4A10);
     sim::UsbDeviceSim& second = addDevice(0x5C1D, 0x4A20);
-    tree().faults.addListenerCalls = {1};  // the walk must not depend on the listeners
+    tree().faults.addListener.byNumber[1] = sim::kHostFailure;  // the walk must not depend on the listeners
     EXPECT_EQ(callSsMain(0), sim::kHostFailure);
     EXPECT_EQ(first.streamOpenAttempts, 1);
     EXPECT_EQ(second.streamOpenAttempts, 1);

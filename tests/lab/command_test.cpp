@@ -7,7 +7,9 @@
 
 #include <cstdint>
 #include <cstdio>
+#include <cstdlib>
 #include <fstream>
+#include <iterator>
 #include <string>
 #include <vector>
 
@@ -31,6 +33,32 @@ Outcome runLab(const std::string& arguments)
     int status = pclose(pipe);
     outcome.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
     return outcome;
+}
+
+// Standard output and standard error apart, with text fed to standard input.
+struct Streams {
+    int exitCode = -1;
+    std::string output;
+    std::string errors;
+};
+
+Streams runLabStreams(const std::string& arguments, const std::string& input = "")
+{
+    const std::string base = ::testing::TempDir() + "morvanek-lab-streams";
+    std::ofstream(base + ".in", std::ios::binary) << input;
+    std::string command = std::string(MORVANEK_LAB_EXECUTABLE) + " " + arguments + " <" + base + ".in >" + base +
+                          ".out 2>" + base + ".err";
+    int status = std::system(command.c_str());
+    Streams streams;
+    streams.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    auto slurp = [](const std::string& file) {
+        std::ifstream in(file, std::ios::binary);
+        return std::string((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+    };
+    streams.output = slurp(base + ".out");
+    streams.errors = slurp(base + ".err");
+    for (const char* suffix : {".in", ".out", ".err"}) std::remove((base + suffix).c_str());
+    return streams;
 }
 
 const std::string kScenarios = MORVANEK_LAB_SCENARIOS;
@@ -67,6 +95,76 @@ TEST(LabCommand, ExitCodesTellInvalidAndLabErrorAndTheWorstWinsInTextAndJson)
     EXPECT_NE(report["scenarios"][1]["invalid"].get<std::string>().find("bad-json.json: line 3, column"),
               std::string::npos);
     EXPECT_EQ(report["scenarios"][2]["passed"], true);
+}
+
+// Whatever stops the command, --json gives one JSON document on standard
+// output and text mode a line on standard error with nothing on standard output.
+TEST(LabCommand, ErrorsOfTheCommandLineAreOneJsonDocumentOrALineOnStandardError)
+{
+    struct Case {
+        std::string arguments;
+        int exitCode;
+        const char* words;
+    };
+    const Case cases[] = {
+        {"frobnicate x.json", 2, "unknown command \"frobnicate\""},
+        {"inspect picture x.bin", 2, "unknown inspect command \"picture\""},
+        {"run --no-such-option x.json", 2, "--no-such-option"},
+        {"run", 2, "scenario is required"},
+        {"run --memory 0xFFF0:64 " + kScenarios + "/fresh-device.json", 2, "runs past the end of the device's memory"},
+        {"run --memory 0x10000:1 " + kScenarios + "/fresh-device.json", 2, "runs past the end"},
+        {"inspect image /nonexistent.bin", 2, "/nonexistent.bin"},
+        {"inspect identity " + kScenarios + "/images/custom-4B01.bin", 2, "give a 16-byte identity block"},
+        {"run --module /nonexistent.so " + kScenarios + "/fresh-device.json", 3, "nonexistent.so"},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.arguments);
+        Streams text = runLabStreams(c.arguments);
+        EXPECT_EQ(text.exitCode, c.exitCode);
+        EXPECT_NE(text.errors.find(c.words), std::string::npos) << text.errors;
+        EXPECT_EQ(text.output, "");
+
+        Streams json = runLabStreams(c.arguments + " --json");
+        EXPECT_EQ(json.exitCode, c.exitCode);
+        nlohmann::json document = nlohmann::json::parse(json.output);  // throws on anything else on standard output
+        std::string said = document.contains("error") ? document["error"].get<std::string>() : document.dump();
+        EXPECT_NE(said.find(c.words), std::string::npos) << json.output;
+        EXPECT_EQ(document["exitCode"], c.exitCode);
+    }
+}
+
+TEST(LabCommand, SaysItsVersionAndReadsAScenarioFromStandardInput)
+{
+    Streams version = runLabStreams("--version");
+    EXPECT_EQ(version.exitCode, 0);
+    EXPECT_NE(version.output.find("morvanek-lab for the morvanek module 1.4.3f0"), std::string::npos) << version.output;
+    EXPECT_EQ(nlohmann::json::parse(runLabStreams("--version --json").output)["moduleVersion"], "0x0143C000");
+
+    std::ifstream scenario(kScenarios + "/fresh-device.json");
+    std::string text((std::istreambuf_iterator<char>(scenario)), std::istreambuf_iterator<char>());
+    // Files a scenario on standard input names are found from the current folder; this one names none.
+    Streams piped = runLabStreams("run -", text);
+    EXPECT_EQ(piped.exitCode, 0) << piped.output << piped.errors;
+    EXPECT_NE(piped.output.find("PASS  (standard input)"), std::string::npos) << piped.output;
+    Streams broken = runLabStreams("run -", "{\"devices\": [}");
+    EXPECT_EQ(broken.exitCode, 2);
+    EXPECT_NE(broken.errors.find("(standard input): line 1, column 14: JSON syntax error"), std::string::npos)
+        << broken.errors;
+}
+
+// A number too large for a double used to escape as an exception: the lab
+// failed (exit 3) and the other scenarios' results were lost with it.
+TEST(LabCommand, AnOverflowingNumberIsAnInvalidScenarioAndTheOthersStillReport)
+{
+    const std::string overflowing = ::testing::TempDir() + "morvanek-lab-overflow.json";
+    std::ofstream(overflowing) << R"({"steps": [{"do": "getCurrentVersion", "status": 1e999}]})";
+    Streams json = runLabStreams("run --json " + kScenarios + "/fresh-device.json " + overflowing);
+    EXPECT_EQ(json.exitCode, 2) << json.errors;
+    nlohmann::json report = nlohmann::json::parse(json.output);
+    ASSERT_EQ(report["scenarios"].size(), 2u);
+    EXPECT_EQ(report["scenarios"][0]["passed"], true);
+    EXPECT_NE(report["scenarios"][1]["invalid"].get<std::string>().find("1e999 is out of range"), std::string::npos);
+    std::remove(overflowing.c_str());
 }
 
 TEST(LabCommand, InspectImageSaysWhatTheModuleConcludes)

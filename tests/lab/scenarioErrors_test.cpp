@@ -28,8 +28,6 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
          "found a fractional number"},
         {R"({"devices": [{"name": "a", "vendorId": "0x5C1G"}]})", "/devices/0/vendorId", "\"0x5C1G\" is not a number"},
         {R"({"devices": [{"name": "a", "vendorId": -1}]})", "/devices/0/vendorId", "is negative"},
-        {R"({"devices": [{"name": "a", "faults": {"stallRequests": [1, 1e999]}}]})",
-         "/devices/0/faults/stallRequests/1", "a number too large to read"},
         {R"({"devices": [{"name": "a", "memory": [{"address": "0xFFFF", "hex": "00 01"}]}]})",
          "/devices/0/memory/0", "run past the end"},
         {R"({"devices": [{"name": "a", "memory": [{"address": 0, "hex": "ABC"}]}]})",
@@ -52,6 +50,26 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
         {R"({"drives": {"C": {"files": {"a.bin": {"hex": "00", "text": "x"}}}}})",
          "/drives/C/files/a.bin", "exactly one of"},
         {R"({"drives": {"C": {"files": {"..\\a.bin": {"hex": "00"}}}}})", "/drives/C/files/..\\a.bin", "\"..\""},
+        {R"({"fileFaults": {"failOpen": [{"status": -1}]}})", "/fileFaults/failOpen/0", "missing field \"number\""},
+        {R"({"fileFaults": {"failOpen": [{"number": 0, "status": -1}]}})", "/fileFaults/failOpen/0/number",
+         "calls count from 1"},
+        {R"({"fileFaults": {"failOpen": {"number": 1, "status": 0}}})", "/fileFaults/failOpen/status",
+         "0 is not a failure"},
+        {R"({"fileFaults": {"failSizeQuery": [{"number": 1, "status": -1, "file": "WINDOWS\\x.bin"}]}})",
+         "/fileFaults/failSizeQuery/0/file", "not a DOS path with its drive letter"},
+        {R"({"fileFaults": {"failSizeQuery": [{"number": 1, "status": -1, "fiel": "C:\\x.bin"}]}})",
+         "/fileFaults/failSizeQuery/0/fiel", "did you mean \"file\""},
+        {R"({"fileFaults": {"failReads": 5}})", "/fileFaults/failReads", "5 is not a failure"},
+        {R"({"host": {"failAddListener": [{"number": 2}]}})", "/host/failAddListener/0", "missing field \"status\""},
+        {R"({"host": {"failFindDevices": [{"number": 1, "status": -1, "file": "C:\\x"}]}})",
+         "/host/failFindDevices/0/file", "unknown field \"file\""},
+        {R"({"host": {"failCreateQuery": true}})", "/host/failCreateQuery", "expected a status"},
+        {R"({"host": {"failSetAttribute": "0x7FFFFFFF"}})", "/host/failSetAttribute", "is not a failure"},
+        {R"({"devices": [{"name": "a", "faults": {"failAttributes": [{"id": 3, "status": -1}]}}]})",
+         "/devices/0/faults/failAttributes/0/id", "attributes 1 (vendor ID), 2 (product ID) and 21"},
+        {R"({"devices": [{"name": "a", "faults": {"failGetDescriptor": 0}}]})", "/devices/0/faults/failGetDescriptor",
+         "0 is not a failure"},
+        {R"({"drives": {"C": {"files": {"a|b.bin": {"hex": "00"}}}}})", "/drives/C/files/a|b.bin", "may not hold '|'"},
         {R"({"expect": {"devices": {"ghost": {"mode": "loader"}}}})",
          "/expect/devices/ghost", "no device named \"ghost\""},
         {R"({"devices": [{"name": "a"}], "expect": {"devices": {"a": {"mode": "bootloader"}}}})",
@@ -70,35 +88,64 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
     }
 }
 
-// A drive's file name must be one a file system can hold, or the run would
-// fail later with the lab's own error instead of the scenario's.
-TEST(MalformedScenario, RefusesFileNamesNoFileSystemHolds)
+// A JSON text that is not a scenario says why, in words about the text, at
+// the place where it goes wrong.
+TEST(MalformedScenario, JsonTextErrorsKeepTheirReason)
 {
-    struct BadName {
-        std::string name;  // as JSON text
+    struct BadText {
+        std::string text;
+        const char* where;
         const char* problem;
     };
-    const BadName cases[] = {
-        {std::string(256, 'a'), "longer than 255 bytes"},
-        {"dir\\" + std::string(256, 'b') + ".bin", "longer than 255 bytes"},
-        {"a\\u0000b.bin", "control characters"},
-        {"a\\u001Fb.bin", "control characters"},
-        {"a?.bin", "any of < > : \" | ? *"},
-        {"dir\\\\a|b.bin", "any of < > : \" | ? *"},
+    const BadText cases[] = {
+        {"{\"description\": \"open", "line 1, column 22", "a string is not closed"},
+        {"{\"description\": \"two\nlines\"}", "line 1, column 21", "control character U+000A (LF) must be escaped"},
+        {"{\"host\": {\"ready\": ture}}", "line 1, column 21", "'ture' is not a JSON value"},
+        {"{\n  // a note\n  \"steps\": []\n}", "line 2, column 3", "comments are not part of JSON"},
+        {"{\"steps\": []} {\"steps\": []}", "line 1, column 15", "text after the end of the JSON value, starting with '{'"},
+        {"{\"steps\": []} and more", "line 1, column 15", "starting with 'and'"},
+        {"{\"steps\": [", "line 1, column 12", "the text ends before the JSON value is complete"},
+        {std::string("{\"a\": 1}\0\x9F\x92", 11), "(whole file)", "not a text file: byte 0x00 at offset 8"},
+        {"\xFF\xFE{\0", "(whole file)", "not a text file: byte 0xFF at offset 0"},
+        {"", "(whole file)", "the file is empty"},
+        {" \n\t ", "(whole file)", "the file is empty"},
+        {R"({"devices": [{"name": "a", "vendorId": 99999999999999999999}]})", "/devices/0/vendorId",
+         "99999999999999999999 is out of range"},
+        {R"({"devices": [{"name": "a", "vendorId": "99999999999999999999"}]})", "/devices/0/vendorId",
+         "is out of range"},
+        {R"({"steps": [{"do": "getCurrentVersion", "status": 1e999}]})", "line 1, column 50", "1e999 is out of range"},
+        {R"({"drives": {"C": {"files": {"a": {"hex": "00"}, "a": {"hex": "01"}}}}})", "/drives/C/files/a",
+         "\"a\" appears twice"},
+        {std::string(70, '[') + std::string(70, ']'), "/0/0/0", "nested more than 64 deep"},
     };
-    for (const BadName& bad : cases) {
-        SCOPED_TRACE(bad.name);
-        const std::string text = R"({"drives": {"C": {"files": {")" + bad.name + R"(": {"hex": "00"}}}}})";
+    for (const BadText& bad : cases) {
+        SCOPED_TRACE(bad.text.substr(0, 60));
         try {
-            lab::parseScenarioText(text, "bad.json", MORVANEK_SOURCE_DIR "/tests/lab/scenarios");
+            lab::parseScenarioText(bad.text, "bad.json", ".");
             ADD_FAILURE() << "accepted";
         } catch (const lab::ScenarioError& error) {
-            EXPECT_EQ(error.where().rfind("/drives/C/files/", 0), 0u) << error.what();
+            EXPECT_EQ(error.where().rfind(bad.where, 0) == 0 || std::string(bad.where) == "(whole file)", true)
+                << error.what();
+            if (std::string(bad.where) == "(whole file)") {
+                EXPECT_EQ(error.where(), "") << error.what();
+            }
             EXPECT_NE(error.problem().find(bad.problem), std::string::npos) << error.what();
         }
     }
-    const std::string longest = R"({"drives": {"C": {"files": {")" + std::string(255, 'a') + R"(": {"hex": "00"}}}}})";
-    EXPECT_NO_THROW(lab::parseScenarioText(longest, "good.json", MORVANEK_SOURCE_DIR "/tests/lab/scenarios"));
+}
+
+TEST(MalformedScenario, ADirectoryOrAMissingFileIsNamedAsSuch)
+{
+    const std::string folder = MORVANEK_SOURCE_DIR "/tests/lab/scenarios";
+    for (const auto& [path, problem] : {std::pair<std::string, const char*>{folder, "is a directory"},
+                                        {folder + "/nowhere.json", "no such file"}}) {
+        try {
+            lab::loadScenarioFile(path);
+            ADD_FAILURE() << path << " accepted";
+        } catch (const lab::ScenarioError& error) {
+            EXPECT_EQ(error.problem().find(problem), 0u) << error.what();
+        }
+    }
 }
 
 // Numbers as JSON numbers, decimal or hexadecimal text; registry keys as the
