@@ -96,22 +96,29 @@ sim::DeviceFaults parseFaults(const JsonNode& node)
 
 DevicePlan parseDevice(const JsonNode& node, const std::filesystem::path& directory)
 {
-    node.allowOnly({"name", "loaderProductId", "vendorId", "attribute21", "present", "identity", "flashDump", "memory",
+    node.allowOnly({"name", "loaderProductId", "vendorId", "attribute21", "present", "startsIn", "identity", "flashDump", "memory",
                     "faults", "timing", "maxLoaderComebacks"});
     DevicePlan device;
     device.name = node.field("name").text();
     if (device.name.empty()) node.field("name").fail("a device needs a name");
     sim::EmulatedDeviceOptions& options = device.options;
     options.name = device.name;
-    if (auto value = node.optionalField("loaderProductId")) options.loaderProductId = id16(*value);
-    if (auto value = node.optionalField("vendorId")) options.vendorId = id16(*value);
+    // USB attributes are 32-bit; the module compares their low 16 bits.
+    if (auto value = node.optionalField("loaderProductId"))
+        options.loaderProductId = static_cast<uint32_t>(value->unsignedNumber(0xFFFFFFFF));
+    if (auto value = node.optionalField("vendorId")) options.vendorId = static_cast<uint32_t>(value->unsignedNumber(0xFFFFFFFF));
     if (auto value = node.optionalField("attribute21")) options.attribute21 = static_cast<uint32_t>(value->unsignedNumber(0xFFFFFFFF));
     if (auto value = node.optionalField("present")) device.present = value->flag();
-    bool hasLayout = sim::findLoaderFlashLayout(options.loaderProductId) != nullptr;
+    bool hasLayout = sim::findLoaderFlashLayout(static_cast<uint16_t>(options.loaderProductId)) != nullptr;
+    if (auto value = node.optionalField("startsIn")) {
+        device.startsIn = powerUp(*value, false);
+        if (device.startsIn == sim::PhysicalDevice::PowerUp::firmware && !hasLayout)
+            value->fail("only a loader of the family (0x4A10 or 0x4A20) has firmware with an identity to start as");
+    }
     if (auto value = node.optionalField("identity")) {
         if (!hasLayout)
             value->fail(fmt::format("a device enumerating with product ID 0x{:04X} has no identity block; only the "
-                                    "loaders 0x4A10 and 0x4A20 have one",
+                                    "loaders 0x4A10 and 0x4A20 (in the low 16 bits) have one",
                                     options.loaderProductId));
         device.identity = parseIdentity(*value);
     }
@@ -149,6 +156,17 @@ DevicePlan parseDevice(const JsonNode& node, const std::filesystem::path& direct
 }
 
 }  // namespace
+
+sim::PhysicalDevice::PowerUp powerUp(const JsonNode& node, bool asFlashAllowed)
+{
+    std::string name = node.text();
+    if (name == "loader") return sim::PhysicalDevice::PowerUp::loader;
+    if (name == "product") return sim::PhysicalDevice::PowerUp::firmware;
+    if (name == "flash" && asFlashAllowed) return sim::PhysicalDevice::PowerUp::asFlashSays;
+    node.fail(asFlashAllowed ? "\"startsIn\" is \"loader\", \"product\" (its firmware runs) or \"flash\" (the firmware "
+                               "when the completion marker is in place, the loader otherwise)"
+                             : "\"startsIn\" is \"loader\" or \"product\" (its firmware runs)");
+}
 
 std::vector<DevicePlan> parseDevices(const JsonNode& node, const std::filesystem::path& directory)
 {

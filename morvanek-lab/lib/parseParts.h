@@ -23,6 +23,9 @@ std::vector<uint8_t> readNamedFile(const JsonNode& node, const std::filesystem::
                                    size_t maximumSize);
 std::filesystem::path resolveNamedPath(const JsonNode& node, const std::filesystem::path& directory);
 
+// "loader", "product" and, when asFlashAllowed, "flash".
+sim::PhysicalDevice::PowerUp powerUp(const JsonNode& node, bool asFlashAllowed);
+
 // A fault's status: a failure, negative as a 32-bit value.
 int32_t failureStatus(const JsonNode& node);
 // A status (every call fails with it), or one or a list of {"number": N,

@@ -129,6 +129,10 @@ StepPlan parseStep(const JsonNode& node, const std::vector<DevicePlan>& devices)
         if (auto via = node.optionalField("via")) step.route = route(*via);
         break;
     case StepKind::plugIn:
+        node.allowOnly({"do", "device", "startsIn"});
+        step.device = deviceName(node.field("device"), devices);
+        if (auto startsIn = node.optionalField("startsIn")) step.startsIn = powerUp(*startsIn, true);
+        break;
     case StepKind::unplug:
         node.allowOnly({"do", "device"});
         step.device = deviceName(node.field("device"), devices);

@@ -73,10 +73,15 @@ void runStep(const StepPlan& plan, World& world, StepRecord& step)
         step.result = callMain(world, plan.route, plan.reason, step);
         step.resultText = statusText(static_cast<int32_t>(*step.result));
         return;
-    case StepKind::plugIn:
+    case StepKind::plugIn: {
         step.title = "plug in " + plan.device;
-        world.device(plan.device).plugIn(*sim::Host::get().tree());
+        sim::PhysicalDevice& device = world.device(plan.device);
+        // A device that was plugged in before starts as a real one would: as its flash says.
+        sim::PhysicalDevice::PowerUp how = plan.startsIn.value_or(
+            device.everPluggedIn() ? sim::PhysicalDevice::PowerUp::asFlashSays : world.plan(plan.device).startsIn);
+        device.plugIn(*sim::Host::get().tree(), how);
         return;
+    }
     case StepKind::unplug:
         step.title = "unplug " + plan.device;
         if (world.device(plan.device).current() == nullptr) step.problem = plan.device + " is not plugged in";

@@ -84,6 +84,9 @@ struct DevicePlan {
     sim::EmulatedDeviceOptions options;  // loader product ID, USB vendor ID, attribute 21, faults, timing
     std::string timingName;              // "fullSpeed", "highSpeed" or empty
     bool present = true;
+    // How it starts the first time it is plugged in: held in its loader, or
+    // running its firmware (enumerating with its identity block's IDs).
+    sim::PhysicalDevice::PowerUp startsIn = sim::PhysicalDevice::PowerUp::loader;
     std::vector<uint8_t> flashDump;  // loaded at address 0 first
     std::optional<sim::IdentityValues> identity;
     std::vector<sim::MemoryBytes> memory;  // last, over the dump and the identity
@@ -114,6 +117,9 @@ struct StepPlan {
     MainRoute route = MainRoute::moduleMain;
     uint32_t reason = 0;
     std::string device;
+    // plugIn: how the device starts; unset: as the device's startsIn the
+    // first time, as its flash says after that.
+    std::optional<sim::PhysicalDevice::PowerUp> startsIn;
     uint32_t state = 0;
     int32_t statusIn = 0;
     uint32_t newest = 0;

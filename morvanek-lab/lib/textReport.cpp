@@ -77,7 +77,8 @@ std::string nowStory(const DeviceRecord& device)
 void printDevice(std::FILE* out, const RunRecord& record, int index, const RunOptions& options)
 {
     const DeviceRecord& device = record.devices[static_cast<size_t>(index)];
-    if (device.layout != nullptr && device.options.vendorId == sim::kDeviceFamilyVendorId) {
+    // The module looks at the low 16 bits of the vendor attribute only.
+    if (device.layout != nullptr && (device.options.vendorId & 0xFFFF) == sim::kDeviceFamilyVendorId) {
         fmt::print(out, "  device {} (loader {:04X}:{:04X})\n", device.name, device.options.vendorId,
                    device.options.loaderProductId);
     } else {

@@ -182,7 +182,7 @@ void World::buildDevices()
         for (const sim::MemoryBytes& bytes : plan.memory) device->flash.load(bytes.address, bytes.bytes);
         flashBefore_.push_back(device->readMemory(0, sim::FlashMemory::kSize));
         observer_.watch(*device, static_cast<int>(i));
-        if (plan.present) device->plugIn(*sim::Host::get().tree());
+        if (plan.present) device->plugIn(*sim::Host::get().tree(), plan.startsIn);
         devices_.push_back(device);
     }
 }
@@ -192,6 +192,14 @@ void World::armAllocationFaults()
     sim::Allocator& allocator = sim::Host::get().allocator;
     for (size_t nth : scenario_.host.failAllocations) allocator.failNth(nth);
     allocator.failAll(scenario_.host.failAllAllocations);
+}
+
+const DevicePlan& World::plan(const std::string& name) const
+{
+    for (const DevicePlan& plan : scenario_.devices) {
+        if (plan.name == name) return plan;
+    }
+    throw LabError("no device named " + name);
 }
 
 sim::PhysicalDevice& World::device(const std::string& name)

@@ -29,6 +29,7 @@ public:
     sim::ModuleImage& module() { return *module_; }
     RunObserver& observer() { return observer_; }
     sim::PhysicalDevice& device(const std::string& name);
+    const DevicePlan& plan(const std::string& name) const;
     std::vector<std::shared_ptr<sim::PhysicalDevice>>& devices() { return devices_; }
     const std::vector<std::vector<uint8_t>>& flashBefore() const { return flashBefore_; }
 

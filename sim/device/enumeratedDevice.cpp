@@ -2,7 +2,7 @@
 
 namespace sim {
 
-EnumeratedDevice::EnumeratedDevice(std::shared_ptr<PhysicalDevice> hardware, uint16_t vendorId, uint16_t productId)
+EnumeratedDevice::EnumeratedDevice(std::shared_ptr<PhysicalDevice> hardware, uint32_t vendorId, uint32_t productId)
     : UsbDeviceSim(vendorId, productId, hardware->options().attribute21), hardware_(std::move(hardware))
 {
     name = hardware_->options().name;

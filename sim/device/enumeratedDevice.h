@@ -11,7 +11,7 @@ namespace sim {
 
 class EnumeratedDevice : public UsbDeviceSim {
 public:
-    EnumeratedDevice(std::shared_ptr<PhysicalDevice> hardware, uint16_t vendorId, uint16_t productId);
+    EnumeratedDevice(std::shared_ptr<PhysicalDevice> hardware, uint32_t vendorId, uint32_t productId);
     ~EnumeratedDevice() override;
 
     uint32_t getAttribute(uint32_t id, tStatus* status) override;

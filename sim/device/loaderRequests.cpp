@@ -62,6 +62,7 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
         std::string who = current_ != nullptr ? current_->describe() : options_.name;
         notes.push_back(who + " stopped answering at request " + std::to_string(record.sequence));
         unplugged_ = true;
+        unplugFired_ = true;
         disconnect();
         outcome = kHostDeviceGone;
     }

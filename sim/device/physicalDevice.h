@@ -50,8 +50,10 @@ struct MemoryBytes {
 
 struct EmulatedDeviceOptions {
     std::string name;
-    uint16_t loaderProductId = 0x4A10;
-    uint16_t vendorId = kDeviceFamilyVendorId;  // the loader's own, not the identity block's
+    // The USB attributes 2 and 1 the loader enumerates with: 32-bit values of
+    // which the module compares the low 16 bits, as the flash layout is chosen.
+    uint32_t loaderProductId = 0x4A10;
+    uint32_t vendorId = kDeviceFamilyVendorId;  // the loader's own, not the identity block's
     uint32_t attribute21 = 0;
     // Initial flash, over a blank part: the identity block, an image already
     // installed at the firmware base, then any further bytes, in that order.
@@ -81,7 +83,10 @@ public:
     std::function<void(const PhysicalDevice&, const RequestRecord&)> requestObserver;
 
     const EmulatedDeviceOptions& options() const { return options_; }
-    const LoaderFlashLayout* layout() const { return findLoaderFlashLayout(options_.loaderProductId); }
+    const LoaderFlashLayout* layout() const
+    {
+        return findLoaderFlashLayout(static_cast<uint16_t>(options_.loaderProductId));
+    }
     uint64_t requestCount() const { return requests_; }
     int loaderComebacks() const { return loaderComebacks_; }
     bool unplugged() const { return unplugged_; }
@@ -95,9 +100,20 @@ public:
     std::vector<uint8_t> readMemory(uint16_t address, size_t count) const { return flash.read(address, count); }
     bool completionMarkerInPlace() const;
 
-    // Comes into the tree in loader mode and is announced; resets the unplug
-    // fault and the count of loader-mode comebacks.
-    LoaderModeDevice& plugIn(DeviceTreeSim& tree);
+    // How the device starts when it is plugged in: held in its loader, in
+    // its firmware, or as it starts at power-up, which is what the restart
+    // does too: the firmware when the completion marker is in place, the
+    // loader otherwise. Its flash is whatever it held when it was pulled out.
+    enum class PowerUp { loader, firmware, asFlashSays };
+
+    // Comes into the tree and is announced, after any earlier enumeration of
+    // it and in that one's place in the host's search order (it stays on its
+    // port). An unplugAtRequest fault that has fired is spent; one that has
+    // not stays armed (request numbers count over the device's life). The
+    // count of loader-mode comebacks starts again.
+    EnumeratedDevice& plugIn(DeviceTreeSim& tree, PowerUp how);
+    LoaderModeDevice& plugIn(DeviceTreeSim& tree);  // held in its loader
+    bool everPluggedIn() const { return lastEnumeration_ != nullptr; }
     // Pulled out: the current enumeration is gone and its removal delivered.
     void unplug();
 
@@ -119,6 +135,8 @@ private:
 
     EmulatedDeviceOptions options_;
     EnumeratedDevice* current_ = nullptr;
+    const UsbDeviceSim* lastEnumeration_ = nullptr;  // where the next enumeration takes its place; never read through
+    bool unplugFired_ = false;
     uint64_t requests_ = 0;
     int loaderComebacks_ = 0;
     bool unplugged_ = false;

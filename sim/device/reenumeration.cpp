@@ -19,17 +19,35 @@ void PhysicalDevice::disconnect()
     if (leaving.present) treeOf(leaving).queueRemoval(leaving);
 }
 
-LoaderModeDevice& PhysicalDevice::plugIn(DeviceTreeSim& tree)
+EnumeratedDevice& PhysicalDevice::plugIn(DeviceTreeSim& tree, PowerUp how)
 {
     disconnect();
     if (unplugged_) {
-        // A device that stopped answering answers again once it is plugged back in.
-        faults.unplugAtRequest = 0;
+        // Pulled out by its fault, it comes back for good; pulled out by hand, its fault still waits.
+        if (unplugFired_) faults.unplugAtRequest = 0;
+        unplugFired_ = false;
         unplugged_ = false;
     }
     loaderComebacks_ = 0;
-    auto loader = std::make_unique<LoaderModeDevice>(shared_from_this());
-    return static_cast<LoaderModeDevice&>(tree.plugIn(std::move(loader)));
+    bool firmware = how == PowerUp::firmware || (how == PowerUp::asFlashSays && completionMarkerInPlace());
+    std::unique_ptr<EnumeratedDevice> next;
+    if (firmware) {
+        IdentityValues identity = this->identity();
+        next = std::make_unique<ProductDevice>(shared_from_this(), identity.vendorId, identity.productId);
+    } else {
+        next = std::make_unique<LoaderModeDevice>(shared_from_this());
+    }
+    EnumeratedDevice& arriving = *next;
+    tree.adopt(std::move(next), lastEnumeration_);
+    lastEnumeration_ = &arriving;
+    tree.queueArrival(arriving);
+    tree.deliverPendingEvents();
+    return arriving;
+}
+
+LoaderModeDevice& PhysicalDevice::plugIn(DeviceTreeSim& tree)
+{
+    return static_cast<LoaderModeDevice&>(plugIn(tree, PowerUp::loader));
 }
 
 void PhysicalDevice::unplug()
@@ -56,6 +74,11 @@ void PhysicalDevice::leaveLoaderMode()
         loaderComebacks_ = 0;
         IdentityValues identity = this->identity();
         next = std::make_unique<ProductDevice>(shared_from_this(), identity.vendorId, identity.productId);
+        if (findLoaderFlashLayout(identity.productId) != nullptr && identity.vendorId == kDeviceFamilyVendorId) {
+            // The firmware takes its IDs from the identity block, loader IDs or not; it speaks no loader protocol.
+            notes.push_back(who + " restarted into its firmware, which enumerates with the loader IDs of its identity "
+                                  "block and does not answer the loader's requests");
+        }
     } else {
         ++loaderComebacks_;
         next = std::make_unique<LoaderModeDevice>(shared_from_this());
@@ -65,7 +88,8 @@ void PhysicalDevice::leaveLoaderMode()
                         (announce ? "" : "; the host no longer announces it"));
     }
     EnumeratedDevice& arriving = *next;
-    tree.adopt(std::move(next));
+    tree.adopt(std::move(next), lastEnumeration_);
+    lastEnumeration_ = &arriving;
     if (announce) {
         tree.queueArrival(arriving);
     } else {

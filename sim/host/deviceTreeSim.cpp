@@ -149,10 +149,15 @@ void DeviceTreeSim::unplug(UsbDeviceSim& device)
     deliverPendingEvents();
 }
 
-void DeviceTreeSim::adopt(std::unique_ptr<UsbDeviceSim> device)
+void DeviceTreeSim::adopt(std::unique_ptr<UsbDeviceSim> device, const UsbDeviceSim* after)
 {
     device->tree = this;
-    devices_.push_back(std::move(device));
+    auto place = std::find_if(devices_.begin(), devices_.end(), [&](const auto& d) { return d.get() == after; });
+    if (after == nullptr || place == devices_.end()) {
+        devices_.push_back(std::move(device));
+    } else {
+        devices_.insert(place + 1, std::move(device));
+    }
 }
 
 void DeviceTreeSim::queueArrival(UsbDeviceSim& device)

@@ -113,7 +113,9 @@ public:
     // deliverPendingEvents(), never from inside the call that caused them.
     void queueArrival(UsbDeviceSim& device);
     void queueRemoval(UsbDeviceSim& device);
-    void adopt(std::unique_ptr<UsbDeviceSim> device);  // kept alive, not yet present
+    // Kept alive, not yet present; placed in the search order right after
+    // `after` (an earlier enumeration of the same device) when given.
+    void adopt(std::unique_ptr<UsbDeviceSim> device, const UsbDeviceSim* after = nullptr);
     void deliverPendingEvents();
 
     std::vector<UsbDeviceSim*> presentDevices() const;

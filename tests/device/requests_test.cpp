@@ -150,4 +150,58 @@ TEST_P(Reenumeration, WithoutTheMarkerTheDeviceComesBackInLoaderModeAndIsAnnounc
     EXPECT_EQ(hardware.current()->getAttribute(2, nullptr), 0x4B03u);
 }
 
+// Restarted or plugged in again, a device keeps its place in the host's
+// search order, and a power-up starts it as its flash says.
+TEST_P(Reenumeration, PluggedInAgainTheDeviceStartsAsItsFlashSaysInItsPlace)
+{
+    sim::PhysicalDevice& first = plugIn({0xAA, 0x55}).hardware();
+    sim::PhysicalDevice& second = plugIn({0xFF, 0xFF}).hardware();
+    auto order = [&] { return tree().presentDevices(); };
+
+    EXPECT_EQ(RawLink(*first.current()).restart(), 0);
+    tree().deliverPendingEvents();
+    EXPECT_EQ(order(), (std::vector<sim::UsbDeviceSim*>{first.current(), second.current()}));
+    EXPECT_EQ(dynamic_cast<sim::ProductDevice*>(first.current()) != nullptr, true);
+
+    first.unplug();
+    second.unplug();
+    second.plugIn(tree(), sim::PhysicalDevice::PowerUp::asFlashSays);
+    first.plugIn(tree(), sim::PhysicalDevice::PowerUp::asFlashSays);
+    EXPECT_EQ(order(), (std::vector<sim::UsbDeviceSim*>{first.current(), second.current()}));
+    EXPECT_EQ(first.current()->getAttribute(2, nullptr), 0x4B03u) << "programmed and restarted: its firmware runs";
+    EXPECT_EQ(second.current()->getAttribute(2, nullptr), GetParam().productId) << "no marker: its loader runs";
+
+    // Held in the loader, or started in its firmware, whatever the flash holds.
+    first.plugIn(tree(), sim::PhysicalDevice::PowerUp::loader);
+    EXPECT_EQ(first.current()->getAttribute(2, nullptr), GetParam().productId);
+    second.plugIn(tree(), sim::PhysicalDevice::PowerUp::firmware);
+    EXPECT_EQ(second.current()->getAttribute(2, nullptr), 0x4B03u);
+    EXPECT_EQ(order().size(), 2u);
+}
+
+// An unplug fault that fired is spent by the next plug-in; one that has not
+// fired yet survives a pull and plug by hand.
+TEST_F(DeviceTest, AnUnplugFaultIsSpentOnceItFiredAndKeptUntilThen)
+{
+    sim::EmulatedDeviceOptions options;
+    options.faults.unplugAtRequest = 3;
+    sim::PhysicalDevice& hardware = sim::plugInLoaderDevice(options).hardware();
+    {
+        RawLink link(*hardware.current());
+        EXPECT_EQ(link.read(0, 4).size(), 4u);
+    }
+    hardware.unplug();
+    hardware.plugIn(tree());
+    {
+        RawLink link(*hardware.current());
+        EXPECT_EQ(link.send(kIn, 0xB0, 0, 0, 4, link.buffer), 0);
+        EXPECT_EQ(link.send(kIn, 0xB0, 0, 0, 4, link.buffer), sim::kHostDeviceGone);  // request 3
+    }
+    EXPECT_TRUE(hardware.unplugged());
+    hardware.plugIn(tree());
+    RawLink link(*hardware.current());
+    for (int i = 0; i < 5; ++i) EXPECT_EQ(link.send(kIn, 0xB0, 0, 0, 4, link.buffer), 0);
+    EXPECT_EQ(hardware.faults.unplugAtRequest, 0u);
+}
+
 }  // namespace

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <cstdint>
 #include <cstdio>
@@ -44,7 +45,10 @@ struct Streams {
 
 Streams runLabStreams(const std::string& arguments, const std::string& input = "")
 {
-    const std::string base = ::testing::TempDir() + "morvanek-lab-streams";
+    // Tests of this program run side by side under ctest: each call has files of its own.
+    static int calls = 0;
+    const std::string base = ::testing::TempDir() + "morvanek-lab-streams-" + std::to_string(::getpid()) + "-" +
+                             std::to_string(++calls);
     std::ofstream(base + ".in", std::ios::binary) << input;
     std::string command = std::string(MORVANEK_LAB_EXECUTABLE) + " " + arguments + " <" + base + ".in >" + base +
                           ".out 2>" + base + ".err";
@@ -156,7 +160,7 @@ TEST(LabCommand, SaysItsVersionAndReadsAScenarioFromStandardInput)
 // failed (exit 3) and the other scenarios' results were lost with it.
 TEST(LabCommand, AnOverflowingNumberIsAnInvalidScenarioAndTheOthersStillReport)
 {
-    const std::string overflowing = ::testing::TempDir() + "morvanek-lab-overflow.json";
+    const std::string overflowing = ::testing::TempDir() + "morvanek-lab-overflow-" + std::to_string(::getpid()) + ".json";
     std::ofstream(overflowing) << R"({"steps": [{"do": "getCurrentVersion", "status": 1e999}]})";
     Streams json = runLabStreams("run --json " + kScenarios + "/fresh-device.json " + overflowing);
     EXPECT_EQ(json.exitCode, 2) << json.errors;
