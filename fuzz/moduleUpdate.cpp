@@ -189,16 +189,16 @@ void armWorldFault(const fuzzing::UpdateInput& input)
         sim::TreeFaults& faults = sim::Host::get().tree()->faults;
         switch (argument % 5) {
         case 0:
-            faults.createQuery = true;
+            faults.createQuery.everyCall = sim::kHostFailure;
             break;
         case 1:
-            faults.setAttribute = true;
+            faults.setAttribute.everyCall = sim::kHostFailure;
             break;
         case 2:
-            faults.findDevices = true;
+            faults.findDevices.everyCall = sim::kHostFailure;
             break;
         case 3:
-            faults.addListenerCalls = {1 + argument / 5 % 2};
+            faults.addListener.byNumber[1 + argument / 5 % 2] = sim::kHostFailure;
             break;
         default:
             faults.removeListener = true;
