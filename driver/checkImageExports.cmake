@@ -1,6 +1,8 @@
 # The driver image exports exactly the nine names other code calls it by, and
 # the version services' decorated names spell their C++ signatures with the
-# status as `long &`. Run as: cmake -DREADOBJ=... -DUNDNAME=... -DIMAGE=... -P
+# status as `long &`. The import library other drivers link against leaves out
+# the two entry points only the kernel calls.
+# Run as: cmake -DREADOBJ=... -DUNDNAME=... -DIMAGE=... -DIMPLIB=... -P
 cmake_minimum_required(VERSION 3.22)
 
 set(expected_signatures
@@ -59,3 +61,16 @@ foreach(pair IN LISTS expected_signatures)
     message(SEND_ERROR "${name}\n reads as: ${demangled}\n expected: ${signature}")
   endif()
 endforeach()
+
+execute_process(COMMAND ${READOBJ} ${IMPLIB} OUTPUT_VARIABLE library RESULT_VARIABLE result)
+if(NOT result EQUAL 0)
+  message(FATAL_ERROR "llvm-readobj could not read ${IMPLIB}")
+endif()
+foreach(name DllInitialize DllUnload)
+  if(library MATCHES "Symbol: (__imp_)?${name}\n")
+    message(SEND_ERROR "the import library offers ${name}, which only the kernel may call")
+  endif()
+endforeach()
+if(NOT library MATCHES "Symbol: pkgWDMWrapperCallSSMain\n")
+  message(SEND_ERROR "the import library lacks the exports other code links against")
+endif()

@@ -7,17 +7,31 @@
 
 namespace nQVKORD100 {
 
+// The host's tables hold the const dynamic-cast overload in slot 0, the
+// non-const one in slot 1 and the destructor after them. The Itanium ABI lays
+// out virtual functions in declaration order; the MSVC ABI groups the
+// overloads of one name and lays them out in reverse, so there the pair is
+// declared the other way round. The driver build checks the order in its
+// objects' tables.
+#if defined(_MSC_VER)
+#define HOST_DYNAMIC_CAST_PAIR(specifier)                              \
+    virtual void* ___CPPKRLDynamicCast(const void* classId) specifier; \
+    virtual const void* ___CPPKRLDynamicCast(const void* classId) const specifier
+#else
+#define HOST_DYNAMIC_CAST_PAIR(specifier)                                          \
+    virtual const void* ___CPPKRLDynamicCast(const void* classId) const specifier; \
+    virtual void* ___CPPKRLDynamicCast(const void* classId) specifier
+#endif
+
 class tTransferParameter {
 public:
-    virtual const void* ___CPPKRLDynamicCast(const void* classId) const;
-    virtual void* ___CPPKRLDynamicCast(const void* classId);
+    HOST_DYNAMIC_CAST_PAIR();
     virtual ~tTransferParameter() {}
 };
 
 class tTransferParameterUSBControl : public tTransferParameter {
 public:
-    const void* ___CPPKRLDynamicCast(const void* classId) const override;
-    void* ___CPPKRLDynamicCast(const void* classId) override;
+    HOST_DYNAMIC_CAST_PAIR(override);
     ~tTransferParameterUSBControl() override {}
 
     void* data = nullptr;  // null for a request without a data stage
@@ -32,15 +46,13 @@ public:
 
 class tStreamParameter {
 public:
-    virtual const void* ___CPPKRLDynamicCast(const void* classId) const;
-    virtual void* ___CPPKRLDynamicCast(const void* classId);
+    HOST_DYNAMIC_CAST_PAIR();
     virtual ~tStreamParameter() {}
 };
 
 class tControlStreamParameterUSB : public tStreamParameter {
 public:
-    const void* ___CPPKRLDynamicCast(const void* classId) const override;
-    void* ___CPPKRLDynamicCast(const void* classId) override;
+    HOST_DYNAMIC_CAST_PAIR(override);
     ~tControlStreamParameterUSB() override {}
 
     uint32_t first = 0;
@@ -48,6 +60,10 @@ public:
 };
 
 // The host fills it with the device descriptor; the module never reads it.
+// The module places it on its stack, but only the host knows the class's real
+// size, and its constructor writes all of it: the module gives it several
+// times the 20 bytes of the fields it knows, so that a larger host class
+// cannot run over the frame.
 class tUSBDeviceDescriptorProxy {
 public:
     tUSBDeviceDescriptorProxy();
@@ -55,7 +71,9 @@ public:
 
     uint8_t descriptor[18];
     uint16_t length;
+    alignas(8) uint8_t room[104];
 };
+static_assert(sizeof(tUSBDeviceDescriptorProxy) == 128, "the descriptor proxy has 128 bytes of room");
 
 }  // namespace nQVKORD100
 

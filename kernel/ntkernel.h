@@ -49,6 +49,10 @@ static_assert(offsetof(OBJECT_ATTRIBUTES, SecurityDescriptor) == 32, "SecurityDe
 static_assert(offsetof(OBJECT_ATTRIBUTES, SecurityQualityOfService) == 40, "QoS at 40");
 
 constexpr uint32_t kObjCaseInsensitive = 0x40;
+// Arrivals run on whatever thread the host calls back on. A handle opened
+// there without this flag would land in that process's handle table, where
+// user mode could close or swap it between the open and the reads.
+constexpr uint32_t kObjKernelHandle = 0x200;
 
 struct IO_STATUS_BLOCK {
     union {
@@ -91,6 +95,7 @@ static_assert(offsetof(KEY_VALUE_PARTIAL_INFORMATION, Data) == 12, "Data at 12")
 // Files
 constexpr uint32_t kFileReadAccess = 0x20001;  // READ_CONTROL | FILE_READ_DATA
 constexpr uint32_t kFileAttributeNormal = 0x80;
+constexpr uint32_t kFileShareRead = 0x1;
 constexpr uint32_t kFileOpen = 1;
 constexpr uint32_t kFileNonDirectoryFile = 0x40;
 constexpr uint32_t kFileSynchronousIoNonalert = 0x20;

@@ -19,6 +19,7 @@
 #include "lib/examine.h"
 #include "lib/jsonNode.h"
 #include "lib/lab.h"
+#include "lib/pictures.h"
 #include "lib/reports.h"
 #include "lib/scenarioError.h"
 #include "source/versionServices.h"
@@ -38,6 +39,7 @@ struct CommonOptions {
     bool noProgress = false;
     std::string modulePath;
     std::vector<std::string> memory;
+    std::string svgFolder;
 };
 
 // How the command reports what stopped it: a line on standard error, or the
@@ -70,6 +72,8 @@ void addCommonOptions(CLI::App& command, CommonOptions& options)
         ->allow_extra_args(false);
     command.add_flag("--no-progress", options.noProgress, "no progress line, even on a terminal");
     command.add_option("--module", options.modulePath, "the module to load (default: the one built beside the lab)");
+    command.add_option("--svg", options.svgFolder,
+                       "write pictures into this folder: per device a flash map and a timeline on the bus model");
 }
 
 // "0x0200:64" -> address and length, inside the device's 64 KiB.
@@ -107,12 +111,14 @@ int runScenarios(const std::vector<std::string>& files, const CommonOptions& com
         options.scenarioNumber = i + 1;
         options.scenarioCount = files.size();
         results.push_back(lab::runScenarioFile(files[i], options));
+        std::string pictures = common.svgFolder.empty() ? "" : lab::writePicturesOf(results.back(), common.svgFolder);
         if (common.json) continue;
         // A scenario that could not run is an error: its line goes to standard error.
         const lab::ScenarioResult& result = results.back();
         bool stopped = !result.invalid.empty() || !result.labError.empty();
         if (i != 0 && !stopped) std::fputs("\n", stdout);
         lab::printTextReport(stopped ? stderr : stdout, result, options);
+        if (!pictures.empty()) fmt::print("{}\n", pictures);
         std::fflush(stopped ? stderr : stdout);
     }
     if (common.json) {

@@ -15,14 +15,15 @@ constexpr uint32_t kAttributeUpdateBar = 21;
 constexpr uint32_t kUpdateBarred = 0xFFFFFFFF;
 constexpr uint32_t kDeviceSearchSelector = 4;
 
-ListenerRecord* makeListenerRecord(uint32_t eventKind, uint32_t queryId, DeviceEventCallback* callback)
+// The query's id is read once the record exists, and only then.
+ListenerRecord* makeListenerRecord(uint32_t eventKind, DeviceQuery* query, DeviceEventCallback* callback)
 {
     ListenerRecord* record = static_cast<ListenerRecord*>(allocateFromHost(sizeof(ListenerRecord)));
     if (record == nullptr) return nullptr;
     record->eventKind = eventKind;
     record->one = 1;
     record->zero = 0;
-    record->queryId = queryId;
+    record->queryId = query->getId();
     record->callback = callback;
     return record;
 }
@@ -80,8 +81,8 @@ DeviceTable::DeviceTable(tStatus& status)
         DeviceTable::deviceArrived(list.devices[i], deviceStatus);
     }
 
-    arrivalRecord = makeListenerRecord(kListenerArrival, query->getId(), static_cast<DeviceTableArrivalBase*>(this));
-    removalRecord = makeListenerRecord(kListenerRemoval, query->getId(), static_cast<DeviceTableRemovalBase*>(this));
+    arrivalRecord = makeListenerRecord(kListenerArrival, query, static_cast<DeviceTableArrivalBase*>(this));
+    removalRecord = makeListenerRecord(kListenerRemoval, query, static_cast<DeviceTableRemovalBase*>(this));
     if (arrivalRecord == nullptr || removalRecord == nullptr) {
         setFailure(status, kStatusNotObtained);
     } else if (status >= 0) {

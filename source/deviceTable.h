@@ -22,7 +22,9 @@ public:
     void onDeviceEvent(UsbDevice* device) override;
 };
 
-class DeviceTable : public DeviceTableArrivalBase, public DeviceTableRemovalBase {
+// Final, so that the calls from the two bases and from construction reach
+// deviceArrived directly rather than through the table's virtual table.
+class DeviceTable final : public DeviceTableArrivalBase, public DeviceTableRemovalBase {
 public:
     explicit DeviceTable(tStatus& status);
 
@@ -30,11 +32,12 @@ public:
     virtual void deviceRemoved(UsbDevice* device, tStatus& status);
     virtual ~DeviceTable();
 
-    // Firmware loading; these use none of the table's state.
-    void updateFirmware(UsbDevice* device, uint16_t loaderProductId, tStatus& status);
-    void checkIdentity(LoaderChannel& channel, uint16_t& vendorId, uint16_t& productId, uint32_t& serialNumber,
-                       tStatus& status);
-    bool isSerialInRanges(uint32_t serialNumber);
+    // Firmware loading; these use none of the table's state, so they need
+    // no table to be called on.
+    static void updateFirmware(UsbDevice* device, uint16_t loaderProductId, tStatus& status);
+    static void checkIdentity(LoaderChannel& channel, uint16_t& vendorId, uint16_t& productId,
+                              uint32_t& serialNumber, tStatus& status);
+    static bool isSerialInRanges(uint32_t serialNumber);
 
 private:
     iDeviceTree* deviceTree;

@@ -43,14 +43,17 @@ int32_t openImageFile(const WCHAR* path, int32_t mode)
     attributes.Length = sizeof(OBJECT_ATTRIBUTES);
     attributes.RootDirectory = nullptr;
     attributes.ObjectName = &name;
-    attributes.Attributes = kObjCaseInsensitive;
+    attributes.Attributes = kObjCaseInsensitive | kObjKernelHandle;
     attributes.SecurityDescriptor = nullptr;
     attributes.SecurityQualityOfService = nullptr;
     IO_STATUS_BLOCK ioStatus;
     HANDLE file = nullptr;
-    NTSTATUS result = ZwCreateFile(&file, kFileReadAccess, &attributes, &ioStatus, nullptr, kFileAttributeNormal, 0,
-                                   kFileOpen, kFileNonDirectoryFile | kFileSynchronousIoNonalert | kFileSequentialOnly,
-                                   nullptr, 0);
+    // Other readers may share the image (a version check reading its header
+    // while a device is programmed from it); writers stay excluded, so the
+    // image cannot change while it is programmed.
+    NTSTATUS result = ZwCreateFile(&file, kFileReadAccess, &attributes, &ioStatus, nullptr, kFileAttributeNormal,
+                                   kFileShareRead, kFileOpen,
+                                   kFileNonDirectoryFile | kFileSynchronousIoNonalert | kFileSequentialOnly, nullptr, 0);
     if (result < 0) return kNoImageFile;
     return static_cast<int32_t>(reinterpret_cast<intptr_t>(file));
 }

@@ -42,13 +42,13 @@ void logVerificationFailure(const char* location, uint32_t block)
 }
 
 // Writes one block, reads it back and compares it.
-void programBlock(LoaderChannel& channel, uint16_t address, const uint8_t* block, uint8_t* verify, uint32_t length,
-                  uint32_t index, const char* location, tStatus& status)
+void programBlock(LoaderChannel& channel, uint16_t address, const uint8_t* block, uint32_t length, uint32_t index,
+                  const char* location, tStatus& status)
 {
     writeLoaderMemory(channel, address, block, length, status);
-    readLoaderMemory(channel, address, verify, length, status);
+    const int32_t difference = verifyLoaderMemory(channel, address, block, length, status);
     if (status < 0) return;
-    if (findFirstDifference(block, verify, length) >= 0) {
+    if (difference >= 0) {
         logVerificationFailure(location, index);
         setFailure(status, kStatusForeignOrUnverified);
     }
@@ -131,21 +131,19 @@ void DeviceTable::updateFirmware(UsbDevice* device, uint16_t loaderProductId, tS
     }
 
     uint8_t block[kLoaderPageSize];
-    uint8_t verify[kLoaderPageSize];
     const uint32_t wholeBlocks = size / kLoaderPageSize;
     const uint32_t partialLength = size % kLoaderPageSize;
     for (uint32_t i = 0; status >= 0 && i < wholeBlocks; ++i) {
         readImage(file, block, kLoaderPageSize, status);
         if (status < 0) break;
         const uint16_t address = static_cast<uint16_t>(channel.firmwareBase + kLoaderPageSize * i);
-        programBlock(channel, address, block, verify, kLoaderPageSize, i, "source\\DeviceTable:421 - ", status);
+        programBlock(channel, address, block, kLoaderPageSize, i, "source\\DeviceTable:421 - ", status);
     }
     if (partialLength != 0 && status >= 0) {
         readImage(file, block, partialLength, status);
         if (status >= 0) {
             const uint16_t address = static_cast<uint16_t>(channel.firmwareBase + kLoaderPageSize * wholeBlocks);
-            programBlock(channel, address, block, verify, partialLength, wholeBlocks, "source\\DeviceTable:436 - ",
-                         status);
+            programBlock(channel, address, block, partialLength, wholeBlocks, "source\\DeviceTable:436 - ", status);
         }
     }
     ZwClose(imageFileHandle(file));

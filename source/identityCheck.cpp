@@ -72,9 +72,11 @@ void readRegistryProductId(uint16_t& productId, tStatus& status)
     if (status < 0) return;
     WCHAR text[kRegistryProductIdBytes / sizeof(WCHAR) + 1];
     readStringValueAndClose(key, KTEXT("FVTPID"), kRegistryProductIdBytes, text, sizeof(text) / sizeof(WCHAR), status);
-    // Only a clean read is converted: a status the caller brought in, even a
-    // positive one, leaves the product ID as it was.
-    if (status != 0) return;
+    // A positive status the caller brought in does not make a good read
+    // count for nothing: a blank block would then be written with the erased
+    // product word, and a block that is no longer blank is never repaired
+    // from the registry again.
+    if (status < 0) return;
 
     char digits[kRegistryProductIdDigits + 1];
     uint32_t count = 0;

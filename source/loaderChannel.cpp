@@ -82,10 +82,40 @@ void readLoaderMemory(LoaderChannel& channel, uint16_t address, void* destinatio
     }
 }
 
+int32_t verifyLoaderMemory(LoaderChannel& channel, uint16_t address, const uint8_t* expected, uint32_t count,
+                           tStatus& status)
+{
+    if (status < 0) return -1;
+    int32_t difference = -1;
+    uint32_t done = 0;
+    uint16_t current = address;
+    while (done < count) {
+        uint32_t chunk = count - done > kLoaderReadChunk ? kLoaderReadChunk : count - done;
+        // A transfer may report success with fewer bytes than asked. The
+        // buffer still holds what the write before it sent, so a byte the
+        // device did not deliver must not be able to match: each one starts
+        // as the complement of what is expected there.
+        for (uint32_t i = 0; i < chunk; ++i) channel.transferBuffer[i] = static_cast<uint8_t>(~expected[done + i]);
+        sendRequest(channel, kRequestTypeVendorIn, kRequestMemory, 0, current, channel.transferBuffer, chunk, status);
+        if (difference < 0) {
+            int32_t at = findFirstDifference(expected + done, channel.transferBuffer, chunk);
+            if (at >= 0) difference = static_cast<int32_t>(done) + at;
+        }
+        done += chunk;
+        current = static_cast<uint16_t>(current + chunk);
+    }
+    return status < 0 ? -1 : difference;
+}
+
 void writeLoaderMemory(LoaderChannel& channel, uint16_t address, const void* source, uint32_t count,
                        tStatus& status)
 {
     if (status < 0) return;
+    // The data stage passes through the 512-byte transfer buffer.
+    if (count == 0 || count > kTransferBufferSize) {
+        setFailure(status, kStatusMissingOrMalformed);
+        return;
+    }
     copyBytes(channel.transferBuffer, source, count);
     sendRequest(channel, kRequestTypeVendorOut, kRequestMemory, 0, address, channel.transferBuffer, count, status);
 }

@@ -39,6 +39,12 @@ struct LoaderChannel {
 void openLoaderChannel(LoaderChannel& channel, UsbDevice* device, uint16_t loaderProductId, tStatus& status);
 void readLoaderMemory(LoaderChannel& channel, uint16_t address, void* destination, uint32_t count,
                       tStatus& status);
+// Reads count bytes back, in the same requests as readLoaderMemory, and
+// compares them with expected. Returns the index of the first byte that
+// differs, or -1 (also when the status is negative on return).
+int32_t verifyLoaderMemory(LoaderChannel& channel, uint16_t address, const uint8_t* expected, uint32_t count,
+                           tStatus& status);
+// count is 1 to 512; anything else is refused with no request.
 void writeLoaderMemory(LoaderChannel& channel, uint16_t address, const void* source, uint32_t count,
                        tStatus& status);
 void eraseLoaderPage(LoaderChannel& channel, uint16_t page, tStatus& status);

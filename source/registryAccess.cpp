@@ -11,7 +11,7 @@ void initObjectAttributes(OBJECT_ATTRIBUTES& attributes, UNICODE_STRING* name)
     attributes.Length = sizeof(OBJECT_ATTRIBUTES);
     attributes.RootDirectory = nullptr;
     attributes.ObjectName = name;
-    attributes.Attributes = kObjCaseInsensitive;
+    attributes.Attributes = kObjCaseInsensitive | kObjKernelHandle;
     attributes.SecurityDescriptor = nullptr;
     attributes.SecurityQualityOfService = nullptr;
 }

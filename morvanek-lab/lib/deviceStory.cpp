@@ -31,8 +31,10 @@ std::string identityField(uint16_t offset)
     }
 }
 
+}  // namespace
+
 // The device's clock as another bus would have run it: the same requests, the other speed's costs.
-std::chrono::microseconds durationOn(const sim::TimingModel& model, const sim::RequestRecord& request)
+std::chrono::microseconds requestDuration(const sim::TimingModel& model, const sim::RequestRecord& request)
 {
     if (request.outcome == sim::kHostDeviceGone) return std::chrono::microseconds(0);  // never reached the device
     bool done = request.outcome >= 0;
@@ -41,6 +43,8 @@ std::chrono::microseconds durationOn(const sim::TimingModel& model, const sim::R
     uint32_t programmed = done && request.kind == sim::RequestKind::Write ? request.length : 0;
     return model.duration(length, erased, programmed);
 }
+
+namespace {
 
 // The module opens "\??\C:\..."; people know the file as "C:\...".
 std::string withoutObjectPrefix(const std::string& path)
@@ -92,10 +96,15 @@ std::string pageRanges(const std::vector<uint16_t>& pages)
     return fmt::format("{}", fmt::join(parts, ", "));
 }
 
+// Reports of large runs format whole traces: one pass, no formatting call per byte.
 std::string hexBytesText(const std::vector<uint8_t>& bytes)
 {
-    std::string text;
-    for (size_t i = 0; i < bytes.size(); ++i) text += fmt::format(i == 0 ? "{:02X}" : " {:02X}", bytes[i]);
+    static constexpr char kDigits[] = "0123456789ABCDEF";
+    std::string text(bytes.empty() ? 0 : bytes.size() * 3 - 1, ' ');
+    for (size_t i = 0; i < bytes.size(); ++i) {
+        text[i * 3] = kDigits[bytes[i] >> 4];
+        text[i * 3 + 1] = kDigits[bytes[i] & 0xF];
+    }
     return text;
 }
 
@@ -147,8 +156,8 @@ std::vector<UpdateStory> tellDeviceStory(const RunRecord& record, int deviceInde
         size_t update = r < device.updateOf.size() ? static_cast<size_t>(device.updateOf[r]) : 0;
         UpdateStory& story = stories.at(std::min(update, stories.size() - 1));
         ++story.requests;
-        story.fullSpeed += durationOn(fullSpeed, request);
-        story.highSpeed += durationOn(highSpeed, request);
+        story.fullSpeed += requestDuration(fullSpeed, request);
+        story.highSpeed += requestDuration(highSpeed, request);
         if (request.outcome < 0) {
             ++story.failedRequests;
             continue;

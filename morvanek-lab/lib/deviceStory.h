@@ -40,6 +40,9 @@ struct UpdateStory {
     std::chrono::microseconds highSpeed{0};
 };
 
+// How long a request took on a bus model; one that never reached the device took nothing.
+std::chrono::microseconds requestDuration(const sim::TimingModel& model, const sim::RequestRecord& request);
+
 // A request in the short form scenarios use: "read 0x37F8 2", "erase 1", "restart", "... failed".
 std::string requestText(const sim::RequestRecord& request);
 

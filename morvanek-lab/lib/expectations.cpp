@@ -4,7 +4,6 @@
 #include <cctype>
 #include <fstream>
 #include <iterator>
-#include <sstream>
 
 #include <fmt/format.h>
 
@@ -95,6 +94,14 @@ private:
     {
         ++outcome_.checked;
         if (!holds) outcome_.failures.push_back({place, what});
+    }
+
+    // For messages that quote a whole trace: made only when they are shown.
+    template <typename Message>
+    void expectThatLazily(bool holds, const std::string& place, const Message& what)
+    {
+        ++outcome_.checked;
+        if (!holds) outcome_.failures.push_back({place, what()});
     }
 
     void checkStep(const StepRecord& step)
@@ -288,24 +295,30 @@ private:
                                      device.flashAfter[base + difference], image[difference]));
     }
 
+    // Lower case, single spaces: how request texts compare.
     static std::string normalised(const std::string& text)
     {
-        std::istringstream words(text);
-        std::string word;
         std::string out;
-        while (words >> word) {
-            for (char& c : word) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-            out += (out.empty() ? "" : " ") + word;
+        bool space = false;
+        for (char c : text) {
+            if (std::isspace(static_cast<unsigned char>(c)) != 0) {
+                space = !out.empty();
+                continue;
+            }
+            if (space) out += ' ';
+            space = false;
+            out += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
         }
         return out;
     }
 
+    // Request texts are made only for the requests an expectation looks at,
+    // and the whole trace is quoted only when an expectation fails.
     void checkRequests(const RequestsExpectation& expect, const DeviceRecord& device)
     {
-        std::vector<std::string> seen;
+        const std::vector<sim::RequestRecord>& trace = device.trace;
         size_t reads = 0, writes = 0, erases = 0, restarts = 0, failed = 0;
-        for (const sim::RequestRecord& request : device.trace) {
-            seen.push_back(requestText(request));
+        for (const sim::RequestRecord& request : trace) {
             reads += request.kind == sim::RequestKind::Read;
             writes += request.kind == sim::RequestKind::Write;
             erases += request.kind == sim::RequestKind::Erase;
@@ -313,7 +326,7 @@ private:
             failed += request.outcome < 0;
         }
         for (const RequestCountExpectation& count : expect.counts) {
-            size_t value = count.what == "total"   ? device.trace.size()
+            size_t value = count.what == "total"   ? trace.size()
                            : count.what == "read"  ? reads
                            : count.what == "write" ? writes
                            : count.what == "erase" ? erases
@@ -324,46 +337,55 @@ private:
                        fmt::format("{} should have received {}{} request(s); it received {}", device.name, count.count,
                                    kind, value));
         }
-        std::vector<std::string> seenNormalised;
-        for (const std::string& text : seen) seenNormalised.push_back(normalised(text));
+        auto texts = [&](size_t from, size_t to) {
+            std::vector<std::string> out;
+            for (size_t i = from; i < to && i < trace.size(); ++i) out.push_back(requestText(trace[i]));
+            return out;
+        };
+        // requestText is already single-spaced; only its case differs from the normalised form.
         auto same = [&](const std::vector<std::string>& wanted, size_t from) {
             for (size_t i = 0; i < wanted.size(); ++i) {
-                if (seenNormalised[from + i] != normalised(wanted[i])) return false;
+                if (normalised(requestText(trace[from + i])) != normalised(wanted[i])) return false;
             }
             return true;
         };
         if (expect.sequence) {
-            bool holds = expect.sequence->size() == seen.size() && same(*expect.sequence, 0);
-            expectThat(holds, expect.pointer + "/sequence",
-                       fmt::format("{}'s requests should be {}; they were {}", device.name, quoteTexts(*expect.sequence),
-                                   quoteTexts(seen)));
+            bool holds = expect.sequence->size() == trace.size() && same(*expect.sequence, 0);
+            expectThatLazily(holds, expect.pointer + "/sequence", [&] {
+                return fmt::format("{}'s requests should be {}; they were {}", device.name,
+                                   quoteTexts(*expect.sequence), quoteTexts(texts(0, trace.size())));
+            });
         }
         if (expect.startsWith) {
-            bool holds = expect.startsWith->size() <= seen.size() && same(*expect.startsWith, 0);
-            std::vector<std::string> head(seen.begin(), seen.begin() + std::min(seen.size(), expect.startsWith->size()));
-            expectThat(holds, expect.pointer + "/startsWith",
-                       fmt::format("{}'s requests should start {}; they start {}", device.name,
-                                   quoteTexts(*expect.startsWith), quoteTexts(head)));
+            size_t n = expect.startsWith->size();
+            bool holds = n <= trace.size() && same(*expect.startsWith, 0);
+            expectThatLazily(holds, expect.pointer + "/startsWith", [&] {
+                return fmt::format("{}'s requests should start {}; they start {}", device.name,
+                                   quoteTexts(*expect.startsWith), quoteTexts(texts(0, n)));
+            });
         }
         if (expect.endsWith) {
             size_t n = expect.endsWith->size();
-            bool holds = n <= seen.size() && same(*expect.endsWith, seen.size() - n);
-            std::vector<std::string> tail(seen.end() - static_cast<std::ptrdiff_t>(std::min(seen.size(), n)), seen.end());
-            expectThat(holds, expect.pointer + "/endsWith",
-                       fmt::format("{}'s requests should end {}; they end {}", device.name,
-                                   quoteTexts(*expect.endsWith), quoteTexts(tail)));
+            bool holds = n <= trace.size() && same(*expect.endsWith, trace.size() - n);
+            expectThatLazily(holds, expect.pointer + "/endsWith", [&] {
+                return fmt::format("{}'s requests should end {}; they end {}", device.name,
+                                   quoteTexts(*expect.endsWith), quoteTexts(texts(trace.size() - std::min(n, trace.size()), trace.size())));
+            });
         }
+        if (expect.contains.empty() && expect.absent.empty()) return;
+        std::vector<std::string> seenNormalised;
+        for (const sim::RequestRecord& request : trace) seenNormalised.push_back(normalised(requestText(request)));
+        auto received = [&](const std::string& wanted) {
+            return std::find(seenNormalised.begin(), seenNormalised.end(), normalised(wanted)) != seenNormalised.end();
+        };
         for (size_t i = 0; i < expect.contains.size(); ++i) {
-            bool holds = std::find(seenNormalised.begin(), seenNormalised.end(), normalised(expect.contains[i])) !=
-                         seenNormalised.end();
-            expectThat(holds, fmt::format("{}/contains/{}", expect.pointer, i),
-                       fmt::format("{} should have received \"{}\"; it received {}", device.name, expect.contains[i],
-                                   quoteTexts(seen)));
+            expectThatLazily(received(expect.contains[i]), fmt::format("{}/contains/{}", expect.pointer, i), [&] {
+                return fmt::format("{} should have received \"{}\"; it received {}", device.name, expect.contains[i],
+                                   quoteTexts(texts(0, trace.size())));
+            });
         }
         for (size_t i = 0; i < expect.absent.size(); ++i) {
-            bool holds = std::find(seenNormalised.begin(), seenNormalised.end(), normalised(expect.absent[i])) ==
-                         seenNormalised.end();
-            expectThat(holds, fmt::format("{}/absent/{}", expect.pointer, i),
+            expectThat(!received(expect.absent[i]), fmt::format("{}/absent/{}", expect.pointer, i),
                        fmt::format("{} should not have received \"{}\", but did", device.name, expect.absent[i]));
         }
     }

@@ -1,5 +1,6 @@
 #include <fmt/format.h>
 
+#include "busTimeline.h"
 #include "deviceStory.h"
 #include "reports.h"
 
@@ -139,6 +140,7 @@ json scenarioJson(const ScenarioResult& result, const RunOptions& options)
     const RunRecord& record = result.record;
     out["description"] = result.scenario->description;
     out["passed"] = result.expectations.failures.empty();
+    out["busMicroseconds"] = layOutBusTimeline(record).total.count();  // all devices, served one after another
     json steps = json::array();
     for (const StepRecord& step : record.steps) steps.push_back(stepJson(step));
     out["steps"] = steps;

@@ -49,8 +49,8 @@ sim::RequestKind requestKind(const JsonNode& node)
 
 sim::DeviceFaults parseFaults(const JsonNode& node)
 {
-    node.allowOnly({"stallRequests", "stallKinds", "readCorruptions", "unplugAtRequest", "refuseOpenStream",
-                    "refuseAllocateBuffer", "failAttributes", "failGetDescriptor"});
+    node.allowOnly({"stallRequests", "stallKinds", "readCorruptions", "shortReads", "unplugAtRequest",
+                    "refuseOpenStream", "refuseAllocateBuffer", "failAttributes", "failGetDescriptor"});
     sim::DeviceFaults faults;
     if (auto list = node.optionalField("failAttributes")) {
         for (const JsonNode& item : list->itemsOrOne()) {
@@ -86,6 +86,17 @@ sim::DeviceFaults parseFaults(const JsonNode& node)
             if (mask) corruption.xorMask = static_cast<uint8_t>(mask->unsignedNumber(0xFF));
             if (replacement) corruption.replacement = static_cast<uint8_t>(replacement->unsignedNumber(0xFF));
             faults.readCorruptions.push_back(corruption);
+        }
+    }
+    if (auto list = node.optionalField("shortReads")) {
+        for (const JsonNode& item : list->itemsOrOne()) {
+            item.allowOnly({"read", "bytes"});
+            sim::ShortRead shortRead;
+            shortRead.read = item.field("read").unsignedNumber(1000000000);
+            if (shortRead.read == 0) item.field("read").fail("reads count from 1");
+            // 64 bytes or more would be a whole IN data stage: not short.
+            shortRead.bytes = static_cast<uint32_t>(item.field("bytes").unsignedNumber(63));
+            faults.shortReads.push_back(shortRead);
         }
     }
     if (auto at = node.optionalField("unplugAtRequest")) faults.unplugAtRequest = at->unsignedNumber(1000000000);

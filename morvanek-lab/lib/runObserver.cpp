@@ -57,6 +57,7 @@ void RunObserver::onRequest(int index, const sim::PhysicalDevice& device, const 
     }
     int update = std::max(watched.updates - 1, 0);
     watched.updateOf.push_back(update);
+    requestOrder_.push_back(index);
     last_ = Owner{index, update};
 
     if (record.kind == sim::RequestKind::Write && record.outcome >= 0 && !record.data.empty()) {

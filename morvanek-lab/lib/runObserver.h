@@ -29,6 +29,7 @@ public:
     const std::vector<Owner>& registryOwners() const { return registryOwners_; }
     const std::vector<int>& updateOf(int device) const { return devices_.at(device).updateOf; }
     int updates(int device) const { return devices_.at(device).updates; }
+    const std::vector<int>& requestOrder() const { return requestOrder_; }
     const std::vector<WriteNotTaken>& writesNotTaken(int device) const { return devices_.at(device).writesNotTaken; }
 
 private:
@@ -66,6 +67,7 @@ private:
     std::vector<Owner> logOwners_;
     std::vector<Owner> openOwners_;
     std::vector<Owner> registryOwners_;
+    std::vector<int> requestOrder_;
 };
 
 }  // namespace lab

@@ -85,6 +85,7 @@ struct RunRecord {
     std::vector<std::string> debugLines;
     std::vector<sim::PackageEvent> packageEvents;
     std::vector<DeviceRecord> devices;
+    std::vector<int> requestOrder;  // the device of each request of the run, in the order they were made
     std::vector<FileOpenSeen> fileOpens;
     std::vector<Owner> registryCallOwners;  // beside registryCalls
     std::vector<std::string> createdKeys;

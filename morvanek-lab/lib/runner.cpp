@@ -184,6 +184,7 @@ RunRecord takeRecord(const Scenario& scenario, World& world, std::vector<StepRec
         if (!opens[i].hostPath.empty()) seen.size = std::filesystem::file_size(opens[i].hostPath, error);
         record.fileOpens.push_back(seen);
     }
+    record.requestOrder = observer.requestOrder();
     record.createdKeys = sim::kernel::registry().createdKeys();
     record.registryCalls = sim::kernel::registry().calls();
     for (size_t i = 0; i < record.registryCalls.size(); ++i)

@@ -185,12 +185,4 @@ void printTextReport(std::FILE* out, const ScenarioResult& result, const RunOpti
     for (const ExpectationFailure& failure : expectations.failures) fmt::print(out, "  {}: {}\n", failure.place, failure.what);
 }
 
-void printSummary(std::FILE* out, const std::vector<ScenarioResult>& results)
-{
-    if (results.size() < 2) return;
-    size_t passed = 0;
-    for (const ScenarioResult& result : results) passed += result.exitCode() == kExitSuccess;
-    fmt::print(out, "\n{} of {} scenario(s) passed\n", passed, results.size());
-}
-
 }  // namespace lab

@@ -20,6 +20,14 @@ struct ReadCorruption {
     std::optional<uint8_t> replacement;  // when set, read back instead of the stored byte
 };
 
+// A read whose IN data stage ends early, as a flaky bus or a worn-out loader
+// can make it, while the transfer still reports success: only the first
+// `bytes` bytes reach the host's buffer, the rest of it stays as it was.
+struct ShortRead {
+    uint64_t read = 0;  // the device's Nth read request, from 1 over its life
+    uint32_t bytes = 0;
+};
+
 struct DeviceFaults {
     // What the host reports about the device: attribute reads (1 vendor ID,
     // 2 product ID, 21 the host's own) that fail with a status, and a
@@ -32,6 +40,7 @@ struct DeviceFaults {
     std::set<uint64_t> stallRequests;
     std::set<RequestKind> stallKinds;
     std::vector<ReadCorruption> readCorruptions;
+    std::vector<ShortRead> shortReads;
     // From this request on the device no longer answers and leaves the tree;
     // its flash stays as it was. 0: never.
     uint64_t unplugAtRequest = 0;

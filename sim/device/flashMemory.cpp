@@ -4,6 +4,8 @@ namespace sim {
 
 std::vector<uint8_t> FlashMemory::read(uint16_t address, size_t count) const
 {
+    // Whole-memory snapshots are taken often; copy in one go unless the range wraps.
+    if (address + count <= kSize) return std::vector<uint8_t>(bytes_.begin() + address, bytes_.begin() + address + count);
     std::vector<uint8_t> result(count);
     for (size_t i = 0; i < count; ++i) result[i] = bytes_[static_cast<uint16_t>(address + i)];
     return result;

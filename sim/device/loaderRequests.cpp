@@ -56,6 +56,7 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
     record.wIndex = request.wIndex;
     record.length = request.length;
     record.dataPointerGiven = request.data != nullptr;
+    if (record.kind == RequestKind::Read) ++readRequests_;
 
     tStatus outcome = refusal;
     if (outcome >= 0 && faults.unplugAtRequest != 0 && record.sequence >= faults.unplugAtRequest) {
@@ -100,7 +101,10 @@ tStatus PhysicalDevice::carryOut(nQVKORD100::tTransferParameterUSBControl& reque
             if (offset >= request.length) continue;
             bytes[offset] = corruption.replacement ? *corruption.replacement : bytes[offset] ^ corruption.xorMask;
         }
-        std::memcpy(data, bytes.data(), bytes.size());
+        for (const ShortRead& shortRead : faults.shortReads) {
+            if (shortRead.read == readRequests_ && shortRead.bytes < bytes.size()) bytes.resize(shortRead.bytes);
+        }
+        if (!bytes.empty()) std::memcpy(data, bytes.data(), bytes.size());
         if (traceEnabled) record.data = std::move(bytes);
         break;
     }

@@ -88,6 +88,7 @@ public:
         return findLoaderFlashLayout(static_cast<uint16_t>(options_.loaderProductId));
     }
     uint64_t requestCount() const { return requests_; }
+    uint64_t readRequestCount() const { return readRequests_; }
     int loaderComebacks() const { return loaderComebacks_; }
     bool unplugged() const { return unplugged_; }
     // The enumeration that currently stands for the device, or null when it is unplugged.
@@ -138,6 +139,7 @@ private:
     const UsbDeviceSim* lastEnumeration_ = nullptr;  // where the next enumeration takes its place; never read through
     bool unplugFired_ = false;
     uint64_t requests_ = 0;
+    uint64_t readRequests_ = 0;
     int loaderComebacks_ = 0;
     bool unplugged_ = false;
 };

@@ -26,7 +26,12 @@ public:
         }
         attributes[id] = *static_cast<const uint32_t*>(value);
     }
-    uint32_t getId() override { return id_; }
+    uint32_t getId() override
+    {
+        ++tree_.queryIdReads_;
+        return id_;
+    }
+    uint32_t id() const { return id_; }
     bool selectsUsb() const
     {
         auto it = attributes.find(kUsbQueryAttribute);
@@ -57,7 +62,7 @@ void DeviceTreeSim::addListener(ListenerRecord* record, tStatus& status)
         return;
     }
     bool knownQuery = std::any_of(queries_.begin(), queries_.end(),
-                                  [&](const auto& q) { return q->getId() == record->queryId; });
+                                  [&](const auto& q) { return q->id() == record->queryId; });
     if ((record->eventKind != kListenerArrival && record->eventKind != kListenerRemoval) || record->one != 1 ||
         record->zero != 0 || !knownQuery || record->callback == nullptr) {
         host.reportMisuse("addListener with a malformed record");

@@ -140,6 +140,7 @@ tStatus pkgModulePackageEventLog(uint32_t event, const char* firstName, const ch
     entry.secondName = secondName ? secondName : "(null)";
     entry.mainName = mainName ? mainName : "(null)";
     entry.moduleMain = moduleMain;
+    entry.liveBlocks = Host::get().allocator.liveBlocks();
     Host::get().packageEvents.push_back(entry);
     return 0;
 }
@@ -224,28 +225,4 @@ int32_t ssprintf(const char* format, ...)
     va_end(arguments);
     Host::get().debugLines.push_back(line);
     return static_cast<int32_t>(line.size());
-}
-
-uint32_t kvlASCIIToU32Base16(const char* text)
-{
-    uint32_t value = 0;
-    for (const char* p = text; p != nullptr && *p != 0; ++p) {
-        char c = *p;
-        uint32_t digit;
-        if (c >= '0' && c <= '9') digit = c - '0';
-        else if (c >= 'a' && c <= 'f') digit = c - 'a' + 10;
-        else if (c >= 'A' && c <= 'F') digit = c - 'A' + 10;
-        else break;
-        value = (value << 4) | digit;
-    }
-    return value;
-}
-
-char* tSSVersion::toString(char* text) const
-{
-    static const char kPhases[] = {'d', 'a', 'b', 'f'};
-    uint32_t v = packed_;
-    std::snprintf(text, 16, "%u.%u.%u%c%u", v >> 24, (v >> 20) & 0xF, (v >> 16) & 0xF, kPhases[(v >> 14) & 3],
-                  v & 0x3FFF);
-    return text;
 }

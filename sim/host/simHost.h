@@ -41,6 +41,7 @@ struct PackageEvent {
     std::string secondName;
     std::string mainName;
     tModuleMain moduleMain = nullptr;
+    size_t liveBlocks = 0;  // host allocations live when the event came, which shows what ran before it
 };
 
 // Counts live blocks; can be told to fail the Nth allocation from now on, or all.
@@ -125,6 +126,9 @@ public:
     int createQueryCalls() const { return createQueryCalls_; }
     int setAttributeCalls() const { return setAttributeCalls_; }
     int findDevicesCalls() const { return findDevicesCalls_; }
+    // The records now registered, in the order they were added.
+    const std::vector<ListenerRecord*>& listenerRecords() const { return listeners_; }
+    int queryIdReads() const { return queryIdReads_; }
     int addListenerCalls() const { return addListenerCalls_; }
     int removeListenerCalls() const { return removeListenerCalls_; }
     std::vector<std::string> describeLeftovers() const;
@@ -145,6 +149,7 @@ private:
     int createQueryCalls_ = 0;
     int setAttributeCalls_ = 0;
     int findDevicesCalls_ = 0;
+    int queryIdReads_ = 0;
     int addListenerCalls_ = 0;
     int removeListenerCalls_ = 0;
     bool delivering_ = false;

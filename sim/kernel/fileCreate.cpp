@@ -1,5 +1,5 @@
 // ZwCreateFile as the module uses it: open an existing file for reading, by
-// its DOS name, usually without sharing.
+// its DOS name, sharing it with other readers or with nobody.
 #include <cstdio>
 #include <fstream>
 #include <iterator>
@@ -10,6 +10,7 @@
 #include "fileDosPath.h"
 #include "fileWorld.h"
 #include "kernelHandles.h"
+#include "kernelLock.h"
 #include "kernelUtf16.h"
 
 namespace sim::kernel {
@@ -20,9 +21,7 @@ constexpr uint32_t kGenericRead = 0x80000000u;
 // Everything a reader may ask for; any other right would let it change something.
 constexpr uint32_t kReadingRights = kFileReadData | 0x8 /* FILE_READ_EA */ | 0x80 /* FILE_READ_ATTRIBUTES */ |
                                     0x20000 /* READ_CONTROL */ | 0x100000 /* SYNCHRONIZE */ | kGenericRead;
-constexpr uint32_t kFileShareRead = 0x1;
 constexpr uint32_t kAllShareModes = 0x7; // read, write, delete
-constexpr uint32_t kObjKernelHandle = 0x200;
 // Reads without an offset need a synchronous file; directories cannot be read.
 constexpr uint32_t kRequiredOptions = kFileNonDirectoryFile | kFileSynchronousIoNonalert;
 constexpr uint32_t kAcceptedOptions = kRequiredOptions | kFileSequentialOnly;
@@ -48,9 +47,11 @@ NTSTATUS readObjectName(const OBJECT_ATTRIBUTES* attributes, std::u16string& nam
                       "object attributes of length " + std::to_string(attributes->Length));
     if (attributes->RootDirectory != nullptr)
         return misuse(fileStatus::invalidParameter, "a root directory, which the stand-in does not resolve");
-    if ((attributes->Attributes & kObjCaseInsensitive) == 0 ||
-        (attributes->Attributes & ~(kObjCaseInsensitive | kObjKernelHandle)) != 0)
-        return misuse(fileStatus::invalidParameter, "object attributes flags " + hex(attributes->Attributes));
+    // A handle without OBJ_KERNEL_HANDLE belongs to whatever process the
+    // calling thread runs in, where user mode can reach it.
+    if (attributes->Attributes != (kObjCaseInsensitive | kObjKernelHandle))
+        return misuse(fileStatus::invalidParameter, "object attributes flags " + hex(attributes->Attributes) +
+                                                        ", not OBJ_CASE_INSENSITIVE | OBJ_KERNEL_HANDLE (0x240)");
     if (attributes->SecurityDescriptor != nullptr || attributes->SecurityQualityOfService != nullptr)
         return misuse(fileStatus::invalidParameter, "a security descriptor or quality of service on an open");
     const UNICODE_STRING* objectName = attributes->ObjectName;
@@ -140,6 +141,7 @@ extern "C" NTSTATUS ZwCreateFile(HANDLE* fileHandle, uint32_t desiredAccess, OBJ
                                  uint32_t /*fileAttributes: unused by an open*/, uint32_t shareAccess,
                                  uint32_t createDisposition, uint32_t createOptions, void* eaBuffer, uint32_t eaLength)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     using namespace sim::kernel;
     if (fileHandle == nullptr || ioStatus == nullptr)
         return misuse(fileStatus::invalidParameter, "no handle or I/O status block to fill");

@@ -7,6 +7,7 @@
 
 #include "fileWorld.h"
 #include "kernelHandles.h"
+#include "kernelLock.h"
 
 namespace sim::kernel {
 namespace {
@@ -88,6 +89,7 @@ extern "C" NTSTATUS ZwReadFile(HANDLE fileHandle, HANDLE event, void* apcRoutine
                                IO_STATUS_BLOCK* ioStatus, void* buffer, uint32_t length, LARGE_INTEGER* byteOffset,
                                uint32_t* key)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     using namespace sim::kernel;
     OpenFile* file = findOpenFile(fileHandle, "ZwReadFile");
     if (file == nullptr) return fileStatus::invalidHandle;
@@ -129,6 +131,7 @@ extern "C" NTSTATUS ZwReadFile(HANDLE fileHandle, HANDLE event, void* apcRoutine
 extern "C" NTSTATUS ZwQueryInformationFile(HANDLE fileHandle, IO_STATUS_BLOCK* ioStatus, void* information,
                                            uint32_t length, int informationClass)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     using namespace sim::kernel;
     OpenFile* file = findOpenFile(fileHandle, "ZwQueryInformationFile");
     if (file == nullptr) return fileStatus::invalidHandle;
@@ -149,6 +152,7 @@ extern "C" NTSTATUS ZwQueryInformationFile(HANDLE fileHandle, IO_STATUS_BLOCK* i
 extern "C" NTSTATUS ZwSetInformationFile(HANDLE fileHandle, IO_STATUS_BLOCK* ioStatus, void* information,
                                          uint32_t length, int informationClass)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     using namespace sim::kernel;
     OpenFile* file = findOpenFile(fileHandle, "ZwSetInformationFile");
     if (file == nullptr) return fileStatus::invalidHandle;

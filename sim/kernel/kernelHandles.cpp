@@ -3,6 +3,8 @@
 #include <cstdio>
 #include <map>
 
+#include "kernelLock.h"
+
 namespace sim::kernel {
 namespace {
 
@@ -87,6 +89,7 @@ void resetHandles()
 
 extern "C" NTSTATUS ZwClose(HANDLE handle)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     auto& open = sim::kernel::table().open;
     auto it = open.find(reinterpret_cast<intptr_t>(handle));
     if (it == open.end()) {

@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "kernelHandles.h"
+#include "kernelLock.h"
 #include "kernelUtf16.h"
 #include "registryKeyTree.h"
 #include "registrySim.h"
@@ -48,8 +49,11 @@ std::string createKeyArgumentProblem(HANDLE* keyHandle, const OBJECT_ATTRIBUTES*
     if (attributes->ObjectName == nullptr) return "no object name";
     std::string nameProblem = countedStringProblem(*attributes->ObjectName, "the object name");
     if (!nameProblem.empty()) return nameProblem;
-    if (attributes->Attributes != kObjCaseInsensitive)
-        return "object attributes " + hexNumber(attributes->Attributes) + ", not OBJ_CASE_INSENSITIVE (0x40)";
+    // A handle without OBJ_KERNEL_HANDLE belongs to whatever process the
+    // calling thread runs in, where user mode can reach it.
+    if (attributes->Attributes != (kObjCaseInsensitive | kObjKernelHandle))
+        return "object attributes " + hexNumber(attributes->Attributes) +
+               ", not OBJ_CASE_INSENSITIVE | OBJ_KERNEL_HANDLE (0x240)";
     if (attributes->SecurityDescriptor != nullptr) return "a security descriptor was given";
     if (attributes->SecurityQualityOfService != nullptr) return "a security quality of service was given";
     if (keyClass != nullptr) return "a key class was given";
@@ -193,6 +197,7 @@ extern "C" NTSTATUS ZwCreateKey(HANDLE* keyHandle, uint32_t desiredAccess, OBJEC
                                 uint32_t /*titleIndex: ignored by the kernel*/, UNICODE_STRING* keyClass,
                                 uint32_t createOptions, uint32_t* disposition)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     return sim::kernel::RegistryKernelSide::createKey(sim::kernel::registry(), keyHandle, desiredAccess,
                                                       objectAttributes, keyClass, createOptions, disposition);
 }
@@ -200,6 +205,7 @@ extern "C" NTSTATUS ZwCreateKey(HANDLE* keyHandle, uint32_t desiredAccess, OBJEC
 extern "C" NTSTATUS ZwQueryValueKey(HANDLE keyHandle, UNICODE_STRING* valueName, int informationClass,
                                     void* information, uint32_t length, uint32_t* resultLength)
 {
+    std::lock_guard<std::recursive_mutex> callLock(sim::kernel::kernelCallLock());
     return sim::kernel::RegistryKernelSide::queryValue(sim::kernel::registry(), keyHandle, valueName,
                                                        informationClass, information, length, resultLength);
 }

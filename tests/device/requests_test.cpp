@@ -2,6 +2,8 @@
 // streams and buffers, and the restart that re-enumerates the device.
 #include "deviceHarness.h"
 
+#include <sstream>
+
 using namespace device_tests;
 
 namespace {
@@ -93,7 +95,12 @@ class Reenumeration : public DeviceTest, public testing::WithParamInterface<Load
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(BothLoaders, Reenumeration, testing::Values(Loader{0x4A10, 0x0206}, Loader{0x4A20, 0x0606}));
+INSTANTIATE_TEST_SUITE_P(BothLoaders, Reenumeration, testing::Values(Loader{0x4A10, 0x0206}, Loader{0x4A20, 0x0606}),
+                         [](const auto& info) {
+                             std::ostringstream name;
+                             name << "Loader" << std::hex << std::uppercase << info.param.productId;
+                             return name.str();
+                         });
 
 TEST_P(Reenumeration, WithTheMarkerTheDeviceComesBackAsTheProductOfItsIdentityBlock)
 {

@@ -3,6 +3,9 @@
 // last byte or the skipped field shows as a wrong number.
 #include <gtest/gtest.h>
 
+#include <cctype>
+#include <string>
+
 #include "driver/peChecksum.h"
 
 namespace {
@@ -119,6 +122,22 @@ std::vector<NotAnImage> notImages()
     return cases;
 }
 
-INSTANTIATE_TEST_SUITE_P(All, PeChecksumRefuses, testing::ValuesIn(notImages()));
+// "no PE signature" -> "NoPESignature"
+std::string caseName(const testing::TestParamInfo<NotAnImage>& info)
+{
+    std::string name;
+    bool wordStart = true;
+    for (const char* c = info.param.what; *c != '\0'; ++c) {
+        if (*c == ' ') {
+            wordStart = true;
+            continue;
+        }
+        name += wordStart ? static_cast<char>(std::toupper(static_cast<unsigned char>(*c))) : *c;
+        wordStart = false;
+    }
+    return name;
+}
+
+INSTANTIATE_TEST_SUITE_P(All, PeChecksumRefuses, testing::ValuesIn(notImages()), caseName);
 
 }  // namespace

@@ -24,11 +24,11 @@ struct CreateRequest {
     std::u16string name = u"\\??\\C:\\image.bin";  // the whole object name
     int nameBytes = -1;                            // the counted length, when not -1
     uint32_t desiredAccess = kFileReadAccess;
-    uint32_t shareAccess = 0;
+    uint32_t shareAccess = kFileShareRead;
     uint32_t disposition = kFileOpen;
     uint32_t options = kFileNonDirectoryFile | kFileSynchronousIoNonalert | kFileSequentialOnly;
     uint32_t attributesLength = sizeof(OBJECT_ATTRIBUTES);
-    uint32_t attributeFlags = kObjCaseInsensitive;
+    uint32_t attributeFlags = kObjCaseInsensitive | kObjKernelHandle;
     HANDLE rootDirectory = nullptr;
     uint32_t eaLength = 0;
 };

@@ -1,6 +1,6 @@
 // Opening files by DOS name: how names map onto the drive's folder, which
-// names and requests are refused and reported, and the module's opens without
-// sharing.
+// names and requests are refused and reported, and who may open a file while
+// another has it open.
 #include "fileTestWorld.h"
 
 namespace files_test {
@@ -100,7 +100,9 @@ TEST_F(OpenTest, OpensTheModuleNeverAsksForAreRefusedAndReported)
         {"asynchronous", [](CreateRequest& r) { r.options &= ~kFileSynchronousIoNonalert; }, status::invalidParameter},
         {"share nonsense", [](CreateRequest& r) { r.shareAccess = 0x10; }, status::invalidParameter},
         {"short attributes", [](CreateRequest& r) { r.attributesLength = 40; }, status::invalidParameter},
-        {"case-sensitive", [](CreateRequest& r) { r.attributeFlags = 0; }, status::invalidParameter},
+        {"case-sensitive", [](CreateRequest& r) { r.attributeFlags = kObjKernelHandle; }, status::invalidParameter},
+        {"a handle user mode can reach", [](CreateRequest& r) { r.attributeFlags = kObjCaseInsensitive; },
+         status::invalidParameter},
         {"relative to a root", [](CreateRequest& r) { r.rootDirectory = reinterpret_cast<HANDLE>(-4); },
          status::invalidParameter},
         {"extended attributes", [](CreateRequest& r) { r.eaLength = 8; }, status::invalidParameter},
@@ -117,30 +119,36 @@ TEST_F(OpenTest, OpensTheModuleNeverAsksForAreRefusedAndReported)
     }
     EXPECT_TRUE(files().filesOpened().empty());
 
-    // A kernel handle may be asked for, and the name is read only as far as its counted length.
+    // The name is read only as far as its counted length.
     CreateRequest request;
-    request.attributeFlags |= 0x200;
     request.nameBytes = static_cast<int>(request.name.size() * sizeof(WCHAR));
     request.name += u"XYZ";
     EXPECT_EQ(ZwClose(create(request).handle), 0);
 }
 
-TEST_F(OpenTest, AFileHeldOpenByTheModuleOrElsewhereCannotBeOpenedUntilReleased)
+// Readers that all share reading open one file together; an open that does
+// not share excludes every other, and a file held elsewhere stays shut.
+TEST_F(OpenTest, SharingDecidesWhoOpensAFileTogether)
 {
     for (const char* name : {"image.bin", "other.bin", "third.bin"}) writeFile(drive() / name, {});
-    HANDLE first = openOrFail(u"C:\\image.bin");
+    CreateRequest exclusive;
+    exclusive.shareAccess = 0;
+    HANDLE first = create(exclusive).handle;
+    ASSERT_NE(first, nullptr);
     sim::kernel::FileHoldToken hold = files().holdOpenElsewhere(drive() / "other.bin");
 
     EXPECT_EQ(create({u"\\??\\C:\\IMAGE.bin"}).status, status::sharingViolation);  // another spelling, the same file
-    CreateRequest sharing;
-    sharing.shareAccess = 1;
-    EXPECT_EQ(create(sharing).status, status::sharingViolation);  // even an open that shares reading
     EXPECT_EQ(create({u"\\??\\C:\\other.bin"}).ioStatus.Status, status::sharingViolation);
     EXPECT_EQ(ZwClose(openOrFail(u"C:\\third.bin")), 0);
-
     EXPECT_EQ(ZwClose(first), 0);
+
+    HANDLE reader = openOrFail(u"C:\\image.bin");
+    HANDLE secondReader = openOrFail(u"C:\\IMAGE.BIN");
+    EXPECT_EQ(create(exclusive).status, status::sharingViolation);
+    EXPECT_EQ(ZwClose(reader), 0);
+    EXPECT_EQ(ZwClose(secondReader), 0);
+
     files().releaseHold(hold);
-    EXPECT_EQ(ZwClose(openOrFail(u"C:\\image.bin")), 0);
     EXPECT_EQ(ZwClose(openOrFail(u"C:\\other.bin")), 0);
 }
 

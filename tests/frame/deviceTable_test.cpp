@@ -27,6 +27,7 @@ struct ConstructionFailure {
     tStatus expected;
     int addListenerCalls;
     int removeListenerCalls;
+    int queryIdReads;  // one per record obtained, and none for a record that is not
 };
 
 void PrintTo(const ConstructionFailure& failure, std::ostream* out)
@@ -48,6 +49,7 @@ TEST_P(ConstructionFailures, LeaveNothingBehind)
     EXPECT_EQ(tree().liveQueries(), 0u);
     EXPECT_EQ(tree().addListenerCalls(), failure.addListenerCalls);
     EXPECT_EQ(tree().removeListenerCalls(), failure.removeListenerCalls);
+    EXPECT_EQ(tree().queryIdReads(), failure.queryIdReads);
     EXPECT_EQ(host().allocator.liveBlocks(), 1u) << "only the static stop node stays";
 
     host().allocator.clearFaults();
@@ -61,24 +63,43 @@ TEST_P(ConstructionFailures, LeaveNothingBehind)
 // Allocations of a start: 1 the table, 2 the search's array, 3 the arrival
 // record, 4 the removal record.
 const ConstructionFailure kConstructionFailures[] = {
-    {"NoTable", [](sim::Host& h) { h.allocator.failNth(1); }, -50352, 0, 0},
-    {"NoDeviceTree", [](sim::Host& h) { h.setTreePresent(false); }, -50150, 0, 0},
-    {"NoQuery", [](sim::Host& h) { h.tree()->faults.createQuery.everyCall = sim::kHostFailure; }, -50352, 0, 0},
-    {"QueryAttributeFails", [](sim::Host& h) { h.tree()->faults.setAttribute.everyCall = -7; }, -7, 0, 0},
-    {"SearchFails", [](sim::Host& h) { h.tree()->faults.findDevices.byNumber[1] = -8; }, -8, 0, 0},
-    {"SearchArrayNotAllocated", [](sim::Host& h) { h.allocator.failNth(2); }, sim::kHostAllocationFailed, 0, 0},
-    {"NoArrivalRecord", [](sim::Host& h) { h.allocator.failNth(3); }, -50352, 0, 1},
-    {"NoRemovalRecord", [](sim::Host& h) { h.allocator.failNth(4); }, -50352, 0, 1},
+    {"NoTable", [](sim::Host& h) { h.allocator.failNth(1); }, -50352, 0, 0, 0},
+    {"NoDeviceTree", [](sim::Host& h) { h.setTreePresent(false); }, -50150, 0, 0, 0},
+    {"NoQuery", [](sim::Host& h) { h.tree()->faults.createQuery.everyCall = sim::kHostFailure; }, -50352, 0, 0, 0},
+    {"QueryAttributeFails", [](sim::Host& h) { h.tree()->faults.setAttribute.everyCall = -7; }, -7, 0, 0, 0},
+    {"SearchFails", [](sim::Host& h) { h.tree()->faults.findDevices.byNumber[1] = -8; }, -8, 0, 0, 0},
+    {"SearchArrayNotAllocated", [](sim::Host& h) { h.allocator.failNth(2); }, sim::kHostAllocationFailed, 0, 0, 0},
+    {"NoArrivalRecord", [](sim::Host& h) { h.allocator.failNth(3); }, -50352, 0, 1, 1},
+    {"NoRemovalRecord", [](sim::Host& h) { h.allocator.failNth(4); }, -50352, 0, 1, 1},
     {"NoRecords", [](sim::Host& h) {
          h.allocator.failNth(3);
          h.allocator.failNth(4);
-     }, -50352, 0, 0},
-    {"FirstAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListener.byNumber[1] = -9; }, -9, 2, 2},
-    {"SecondAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListener.byNumber[2] = -10; }, -10, 2, 2},
+     }, -50352, 0, 0, 0},
+    {"FirstAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListener.byNumber[1] = -9; }, -9, 2, 2, 2},
+    {"SecondAddListenerFails", [](sim::Host& h) { h.tree()->faults.addListener.byNumber[2] = -10; }, -10, 2, 2, 2},
 };
 
 INSTANTIATE_TEST_SUITE_P(Steps, ConstructionFailures, ::testing::ValuesIn(kConstructionFailures),
                          [](const auto& info) { return std::string(info.param.name); });
+
+// The host tells the two records apart by their kind: the arrival record
+// names the table's primary base, the removal record its second base, both
+// for the table's query.
+TEST_F(DeviceTable, RegistersAnArrivalAndARemovalRecordForItsQuery)
+{
+    EXPECT_EQ(callSsMain(0), 0);
+    const std::vector<ListenerRecord*>& records = tree().listenerRecords();
+    ASSERT_EQ(records.size(), 2u);
+    EXPECT_EQ(records[0]->eventKind, kListenerArrival);
+    EXPECT_EQ(records[1]->eventKind, kListenerRemoval);
+    for (const ListenerRecord* record : records) {
+        EXPECT_EQ(record->one, 1u);
+        EXPECT_EQ(record->zero, 0u);
+        EXPECT_EQ(record->queryId, 0x51u) << "the id of the tree's first query";
+    }
+    EXPECT_NE(records[0]->callback, records[1]->callback);
+    EXPECT_EQ(tree().queryIdReads(), 2);
+}
 
 TEST_F(DeviceTable, PresentDevicesAreHandledBeforeAnyListenerExists)
 {

@@ -58,6 +58,9 @@ TEST_F(Lifecycle, RegistersItsRecordsWithTheHost)
     EXPECT_EQ(event.mainName, "ssMain");
     EXPECT_EQ(event.moduleMain, info.moduleMain);
     EXPECT_EQ(module->dllUnload(), 0);
+    ASSERT_EQ(host().packageEvents.size(), 2u);
+    EXPECT_EQ(host().packageEvents[1].event, 1u);
+    EXPECT_EQ(host().packageEvents[1].liveBlocks, 0u) << "the unload's event comes after the static stop";
 }
 
 TEST_F(Lifecycle, CutsALongRegistryPathTo520Bytes)
@@ -107,6 +110,39 @@ TEST_F(Lifecycle, StartsStopsAndIgnoresOtherReasonsThenUnloads)
     EXPECT_EQ(host().registeredModule, nullptr);
     EXPECT_EQ(host().packageEvents.back().event, 1u);
     EXPECT_TRUE(host().eventLog.empty());
+}
+
+// A host that unloads without stopping the module first: the unload stops the
+// device work itself, so that no listener is left calling into code that is
+// gone, and then the statics, so that nothing stays allocated.
+TEST_F(Lifecycle, UnloadWithoutAStopEndsTheDeviceWorkFirst)
+{
+    addDevice(0x5C1D, 0x4A10, 0xFFFFFFFF);
+    load();
+    EXPECT_EQ(callSsMain(0), 0);
+    ASSERT_EQ(tree().liveListeners(), 2u);
+    EXPECT_EQ(module->dllUnload(), 0);
+    EXPECT_EQ(tree().liveListeners(), 0u);
+    EXPECT_EQ(tree().liveQueries(), 0u);
+    EXPECT_EQ(tree().removeListenerCalls(), 2);
+    EXPECT_EQ(host().allocator.liveBlocks(), 0u);
+    EXPECT_EQ(host().unregistrations, 1);
+    EXPECT_EQ(host().packageEvents.back().event, 1u);
+    EXPECT_EQ(host().packageEvents.back().liveBlocks, 0u);
+}
+
+// A stop node that cannot be allocated is skipped and the start still counts:
+// the next start is only counted, it does not try for a node again, and the
+// stops pair with the starts.
+TEST_F(Lifecycle, AStaticStartWhoseStopNodeIsNotObtainedStillCounts)
+{
+    host().allocator.failNth(1);  // DllInitialize's stop node
+    load();
+    EXPECT_EQ(host().allocator.liveBlocks(), 0u);
+    EXPECT_EQ(callSsMain(0), 0);
+    EXPECT_EQ(host().allocator.liveBlocks(), 3u) << "the table and its two records, and no stop node";
+    EXPECT_EQ(callSsMain(1), 0);
+    EXPECT_EQ(module->dllUnload(), 0);
 }
 
 TEST_F(Lifecycle, AFailedStartThroughTheWrapperIsLoggedAndReturned)

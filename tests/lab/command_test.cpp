@@ -90,7 +90,7 @@ TEST(LabCommand, ExitCodesTellInvalidAndLabErrorAndTheWorstWinsInTextAndJson)
         kBad + "/wrong-expectation.json " + kBad + "/bad-json.json " + kScenarios + "/fresh-device.json";
     Outcome text = runLab("run " + three);
     EXPECT_EQ(text.exitCode, 2);
-    EXPECT_NE(text.output.find("1 of 3 scenario(s) passed"), std::string::npos) << text.output;
+    EXPECT_NE(text.output.find("3 scenarios: 1 passed, 1 failed, 1 invalid"), std::string::npos) << text.output;
     Outcome json = runLab("run --json " + three);
     EXPECT_EQ(json.exitCode, 2);
     nlohmann::json report = nlohmann::json::parse(json.output);  // throws on anything else on standard output

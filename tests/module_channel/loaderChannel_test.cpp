@@ -1,5 +1,6 @@
 // The loader channel against an emulated loader-mode device: the setup values
 // of its requests, how reads are split, and how failures end the requests.
+#include <algorithm>
 #include <utility>
 
 #include "sim/device/enumeratedDevice.h"
@@ -181,5 +182,65 @@ TEST_F(LoaderChannelTest, FailuresEndTheRequestsAndCloseCleansUp)
         EXPECT_EQ(device.hardware().requestCount(), c.requests);
         EXPECT_EQ(leftovers(), std::vector<std::string>{});
         host().allocator.clearFaults();
+    }
+}
+
+// The write's data stage passes through the 512-byte transfer buffer: any
+// other count is refused before a request is made.
+TEST_F(LoaderChannelTest, WritesOfNoneOrMoreThan512BytesAreRefusedUnsent)
+{
+    sim::LoaderModeDevice& device = plugIn();
+    std::vector<uint8_t> bytes(513, 0x11);
+    for (uint32_t count : {0u, 513u, 0x10000u}) {
+        SCOPED_TRACE(count);
+        tStatus status = 0;
+        LoaderChannel channel;
+        openLoaderChannel(channel, &device, 0x4A10, status);
+        writeLoaderMemory(channel, 0x0200, bytes.data(), count, status);
+        closeLoaderChannel(channel);
+        EXPECT_EQ(status, kStatusMissingOrMalformed);
+    }
+    EXPECT_EQ(device.hardware().requestCount(), 0u);
+}
+
+// The read-back makes the reads readLoaderMemory makes and names the first
+// byte that differs, wherever it lies: in the first chunk, a later one, or
+// only in what a short IN data stage did not deliver.
+TEST_F(LoaderChannelTest, VerifyNamesTheFirstDifferenceOrWhatWasNotDelivered)
+{
+    struct Case {
+        const char* what;
+        int32_t changed;  // the expected byte made different; -1: none
+        sim::ShortRead shortRead;
+        int32_t difference;
+    };
+    const Case cases[] = {
+        {"equal", -1, {}, -1},
+        {"first byte", 0, {}, 0},
+        {"third chunk", 133, {}, 133},
+        {"last byte", 199, {}, 199},
+        {"nothing delivered", -1, {1, 0}, 0},
+        {"second chunk short", -1, {2, 35}, 64 + 35},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.what);
+        sim::DeviceFaults faults;
+        if (c.shortRead.read != 0) faults.shortReads = {c.shortRead};
+        sim::LoaderModeDevice& device = plugIn(0x4A10, faults);
+        std::vector<uint8_t> expected = device.hardware().readMemory(0x0400, 200);
+        if (c.changed >= 0) expected[c.changed] ^= 0x01;
+        tStatus status = 0;
+        LoaderChannel channel;
+        openLoaderChannel(channel, &device, 0x4A10, status);
+        // The transfer buffer starts out holding the expected bytes, as it
+        // does after the block's own write: that must not help the compare.
+        std::copy(expected.begin(), expected.end(), channel.transferBuffer);
+        EXPECT_EQ(verifyLoaderMemory(channel, 0x0400, expected.data(), 200, status), c.difference);
+        closeLoaderChannel(channel);
+        EXPECT_EQ(status, 0);
+        ASSERT_EQ(device.hardware().trace.size(), 4u);
+        for (uint32_t i = 0; i < 4; ++i)
+            expectSetup(device.hardware().trace[i], 0xC0, 0xB0, 0, static_cast<uint16_t>(0x0400 + 64 * i),
+                        i < 3 ? 64 : 8);
     }
 }

@@ -130,10 +130,8 @@ protected:
         openLoaderChannel(channel, &device, loaderProductId, outcome.status);
         EXPECT_EQ(outcome.status, 0) << "the channel must open for the check to be seen";
         outcome.status = entryStatus;
-        // checkIdentity uses none of the table's state: the storage only gives the call an object.
-        alignas(DeviceTable) static unsigned char table[sizeof(DeviceTable)];
-        reinterpret_cast<DeviceTable*>(table)->checkIdentity(channel, outcome.vendorId, outcome.productId,
-                                                             outcome.serialNumber, outcome.status);
+        DeviceTable::checkIdentity(channel, outcome.vendorId, outcome.productId, outcome.serialNumber,
+                                   outcome.status);
         closeLoaderChannel(channel);
         for (const sim::RequestRecord& record : device.hardware().trace) outcome.requests.push_back(describe(record));
         return outcome;
@@ -247,8 +245,10 @@ TEST_P(IdentityCheckTable, ReturnsTheIdentityAndMakesExactlyTheseRequests)
 INSTANTIATE_TEST_SUITE_P(Identity, IdentityCheckTable, testing::ValuesIn(kCases),
                          [](const auto& info) { return std::string(info.param.name); });
 
-// A negative status brought in: no request, no registry read. A positive one:
-// the registry is read but only a clean read gives the product ID.
+// A negative status brought in: no request, no registry read. A positive one
+// is kept, and a blank block is repaired with the registry's product as with
+// a status of 0: never written with the erased product word, after which it
+// would no longer be blank and could not be repaired again.
 TEST_F(IdentityCheck, StatusOnEntry)
 {
     for (const sim::IdentityValues& identity : {kBlank, erased(0x00E08820, 0x4B02)}) {
@@ -258,9 +258,19 @@ TEST_F(IdentityCheck, StatusOnEntry)
     }
     EXPECT_EQ(sim::kernel::registry().calls().size(), 0u);
 
+    for (uint16_t loaderProductId : {0x4A10, 0x4A20}) {
+        SCOPED_TRACE(loaderProductId);
+        Outcome outcome = run(loaderProductId, kBlank, {}, 0, 3);
+        EXPECT_EQ(outcome.status, 3);
+        EXPECT_EQ(outcome.vendorId, 0x5C1D);
+        EXPECT_EQ(outcome.productId, 0x4B0C);
+        EXPECT_EQ(outcome.requests, loaderProductId == 0x4A10 ? blankRepaired("4B0C")
+                                                              : on4A20({"write 7DF8 5C1D", "write 7DF0 4B0C"}));
+    }
+
     uint16_t productId = 0xFFFF;
     tStatus status = 3;
     readRegistryProductId(productId, status);
     EXPECT_EQ(status, 3);
-    EXPECT_EQ(productId, 0xFFFF);
+    EXPECT_EQ(productId, 0x4B0C);
 }

@@ -39,9 +39,7 @@ const SerialRange kRanges[] = {
 
 bool inRanges(uint32_t serialNumber)
 {
-    // isSerialInRanges uses none of the table's state; the table is never built.
-    alignas(DeviceTable) static unsigned char storage[sizeof(DeviceTable)];
-    return reinterpret_cast<DeviceTable*>(storage)->isSerialInRanges(serialNumber);
+    return DeviceTable::isSerialInRanges(serialNumber);
 }
 
 }  // namespace

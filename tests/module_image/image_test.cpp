@@ -4,8 +4,9 @@
 // (digit forms and refused bytes of single fields are parseHexField's own
 // tests). Then the update's exits that the device table cannot reach, called
 // directly so that the status each leaves is seen: a status on entry, a loader
-// product ID without a flash map, and an image that opens for its header but
-// not a second time to be programmed.
+// product ID without a flash map, an image that opens for its header but not a
+// second time to be programmed, a read that ends early with success, and a
+// size beyond 4 GiB.
 #include <dlfcn.h>
 
 #include <array>
@@ -19,17 +20,48 @@
 #include "source/firmwareHeader.h"
 #include "tests/support/loaderWorld.h"
 
-// This program's own ZwCreateFile, which the module's linked-in objects call
-// instead of the kernel stand-in's: it records each request exactly, and can
-// refuse one open by its number, which no file on the drive can be made to do
-// between the header read and the programming open of one update.
+// This program's own ZwCreateFile, ZwReadFile and ZwQueryInformationFile,
+// which the module's linked-in objects call instead of the kernel stand-in's:
+// they record each open exactly, and do what no file on the drive can be made
+// to do within one update: refuse the open after the header read, end a read
+// early with success, report a size beyond 4 GiB.
 namespace {
 
 std::vector<std::string> createFileCalls;  // the object name, then every other argument
 size_t refusedCreateFile = 0;              // the call that is refused, counted from 1; 0: none
 NTSTATUS createFileRefusal = 0;
+size_t readFileCalls = 0;
+size_t shortenedReadFile = 0;  // the call that reads one byte less than asked and succeeds; 0: none
+int64_t addedToFileSize = 0;   // to every end-of-file position the kernel reports
+
+template <typename Function>
+Function kernelFunction(const char* name)
+{
+    auto function = reinterpret_cast<Function>(dlsym(RTLD_NEXT, name));
+    if (function == nullptr) std::abort();
+    return function;
+}
 
 }  // namespace
+
+extern "C" NTSTATUS ZwReadFile(HANDLE file, HANDLE event, void* apcRoutine, void* apcContext,
+                               IO_STATUS_BLOCK* ioStatus, void* buffer, uint32_t length, LARGE_INTEGER* byteOffset,
+                               uint32_t* key)
+{
+    static const auto kernelReadFile = kernelFunction<decltype(&ZwReadFile)>("ZwReadFile");
+    if (++readFileCalls == shortenedReadFile && length > 0) --length;
+    return kernelReadFile(file, event, apcRoutine, apcContext, ioStatus, buffer, length, byteOffset, key);
+}
+
+extern "C" NTSTATUS ZwQueryInformationFile(HANDLE file, IO_STATUS_BLOCK* ioStatus, void* information,
+                                           uint32_t length, int informationClass)
+{
+    static const auto kernelQuery = kernelFunction<decltype(&ZwQueryInformationFile)>("ZwQueryInformationFile");
+    NTSTATUS result = kernelQuery(file, ioStatus, information, length, informationClass);
+    if (result >= 0 && informationClass == kFileStandardInformation)
+        static_cast<FILE_STANDARD_INFORMATION*>(information)->EndOfFile.QuadPart += addedToFileSize;
+    return result;
+}
 
 extern "C" NTSTATUS ZwCreateFile(HANDLE* fileHandle, uint32_t desiredAccess, OBJECT_ATTRIBUTES* attributes,
                                  IO_STATUS_BLOCK* ioStatus, LARGE_INTEGER* allocationSize, uint32_t fileAttributes,
@@ -48,9 +80,7 @@ extern "C" NTSTATUS ZwCreateFile(HANDLE* fileHandle, uint32_t desiredAccess, OBJ
     createFileCalls.push_back(sim::utf16ToUtf8(name.Buffer, name.Length / 2) + arguments);
     if (refusedCreateFile == createFileCalls.size()) return createFileRefusal;
 
-    using CreateFile = decltype(&ZwCreateFile);
-    static const auto kernelCreateFile = reinterpret_cast<CreateFile>(dlsym(RTLD_NEXT, "ZwCreateFile"));
-    if (kernelCreateFile == nullptr) std::abort();
+    static const auto kernelCreateFile = kernelFunction<decltype(&ZwCreateFile)>("ZwCreateFile");
     return kernelCreateFile(fileHandle, desiredAccess, attributes, ioStatus, allocationSize, fileAttributes,
                             shareAccess, disposition, options, eaBuffer, eaLength);
 }
@@ -67,6 +97,9 @@ protected:
         LoaderWorld::SetUp();
         createFileCalls.clear();
         refusedCreateFile = 0;
+        readFileCalls = 0;
+        shortenedReadFile = 0;
+        addedToFileSize = 0;
     }
 
     static std::u16string wide(const std::string& text) { return sim::utf8ToUtf16(text); }
@@ -79,7 +112,7 @@ std::string pathOfLength(size_t length)
     return path + std::string(length - path.size() - 4, 'f') + ".bin";
 }
 
-TEST_F(ImageFile, OpensAnExistingFileForReadingOnlyWithoutSharingByPathsOfUpTo259Characters)
+TEST_F(ImageFile, OpensAnExistingFileForReadingSharedOnlyWithReadersByPathsOfUpTo259Characters)
 {
     for (const std::string& path : {std::string("C:\\images\\a.bin"), pathOfLength(259)}) {
         writeFile(path, {1, 2, 3});
@@ -88,12 +121,32 @@ TEST_F(ImageFile, OpensAnExistingFileForReadingOnlyWithoutSharingByPathsOfUpTo25
         ASSERT_NE(file, -1) << path.size();
         EXPECT_EQ(createFileCalls,
                   std::vector<std::string>{"\\??\\" + path +
-                                           " access=20001 length=48 root=0 attributes=40 security=0 allocation=0 "
-                                           "file=80 share=0 disposition=1 options=64 ea=0"});
+                                           " access=20001 length=48 root=0 attributes=240 security=0 allocation=0 "
+                                           "file=80 share=1 disposition=1 options=64 ea=0"});
         // The narrowed handle widens back to the kernel's own, which the caller closes.
         EXPECT_EQ(imageFileHandle(file), sim::kernel::files().opens().back().handle);
         EXPECT_EQ(ZwClose(imageFileHandle(file)), 0);
     }
+}
+
+// Two readers of one image, as when two devices of one product are updated
+// at once or a version check reads the header of an image being programmed.
+TEST_F(ImageFile, TwoOpensOfOneImageOverlap)
+{
+    const std::string image = "C:\\images\\a.bin";
+    writeFile(image, testing_support::makeImage(1000));
+    const int32_t first = openImageFile(wide(image).c_str(), 0x8000);
+    const int32_t second = openImageFile(wide(image).c_str(), 0x8000);
+    ASSERT_NE(first, -1);
+    ASSERT_NE(second, -1);
+    EXPECT_NE(first, second);
+    FirmwareHeader header;
+    tStatus status = 0;
+    readFirmwareHeader(header, wide(image).c_str(), status);
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(header.imageVersion, 0x0143C000u);
+    EXPECT_EQ(ZwClose(imageFileHandle(first)), 0);
+    EXPECT_EQ(ZwClose(imageFileHandle(second)), 0);
 }
 
 TEST_F(ImageFile, RefusesWithoutAnOpenOrWhenTheKernelRefuses)
@@ -195,6 +248,13 @@ TEST_F(ImageFile, HeaderTextsGiveTheirFieldsAndOnlyAMissingImageChangesTheStatus
     }
 }
 
+std::string updateFailed(tStatus status)
+{
+    return "source\\DeviceTable:451 - The firmware update failed.  Leaving device 5C1D 4B01 0001E240 in loader mode  "
+           "Status = " +
+           std::to_string(status);
+}
+
 struct ExitCase {
     const char* name;
     tStatus entry;
@@ -203,6 +263,8 @@ struct ExitCase {
     uint16_t loaderProductId = 0x4A10;
     bool secondOpenRefused = false;
     std::vector<std::string> log = {};  // location and message
+    size_t shortenedRead = 0;           // read 1 is the header's, read 2 block 0's
+    int64_t addedToSize = 0;
 };
 
 class UpdateExits : public ImageFile, public ::testing::WithParamInterface<ExitCase> {};
@@ -220,6 +282,8 @@ TEST_P(UpdateExits, EndWithTheirStatus)
         refusedCreateFile = 2;
         createFileRefusal = sim::kernel::fileStatus::sharingViolation;
     }
+    shortenedReadFile = c.shortenedRead;
+    addedToFileSize = c.addedToSize;
     {
         tStatus tableStatus = 0;
         DeviceTable table(tableStatus);
@@ -243,6 +307,11 @@ const ExitCase kExitCases[] = {
     {"ImageOpensOnlyForItsHeader", 0, -50150, 3, 0x4A10, true,
      {"source\\DeviceTable:385 - Unable to open firmware image C:\\WINDOWS\\system32\\drivers\\QVUSB4B01.bin.  "
       "Leaving device 5C1D 4B01 0001E240 in loader mode."}},
+    // The size was checked before the erase, so a read that brings less than
+    // asked fails although the kernel reports success.
+    {"ImageReadEndsEarlyWithSuccess", 0, -50207, 3 + 2, 0x4A10, false, {updateFailed(-50207)}, 2},
+    // All 64 bits of the size count: 4 GiB and 1000 bytes are not 1000 bytes.
+    {"ImageOver4GiB", 0, -50150, 3, 0x4A10, false, {updateFailed(-50150)}, 0, int64_t{1} << 32},
 };
 
 INSTANTIATE_TEST_SUITE_P(Exits, UpdateExits, ::testing::ValuesIn(kExitCases),

@@ -163,7 +163,7 @@ class LocateFirmwareImage : public LocationWorld, public testing::WithParamInter
 
 }  // namespace
 
-TEST_P(RegistryString, IsCopiedWhole_OrRefusedWithTheDestinationUntouched)
+TEST_P(RegistryString, IsCopiedWholeOrRefusedWithTheDestinationUntouched)
 {
     const StringCase& c = GetParam();
     sim::kernel::registry().setString(kKey, "Text", "abc");

@@ -31,7 +31,7 @@ struct KeyName {
         RtlInitUnicodeString(&name, text.c_str());
         attributes.Length = sizeof(OBJECT_ATTRIBUTES);
         attributes.ObjectName = &name;
-        attributes.Attributes = kObjCaseInsensitive;
+        attributes.Attributes = kObjCaseInsensitive | kObjKernelHandle;
     }
     KeyName(const KeyName&) = delete;
 

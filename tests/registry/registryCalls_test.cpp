@@ -128,7 +128,7 @@ TEST_F(RegistryTest, ArgumentsAndHandlesTheModuleMustNotPassAreReportedAndRefuse
         [](KeyName& k) { k.attributes.RootDirectory = reinterpret_cast<HANDLE>(-4); },
         [](KeyName& k) { k.attributes.ObjectName = nullptr; },
         [](KeyName& k) { k.attributes.Attributes = 0; },      // case-sensitive
-        [](KeyName& k) { k.attributes.Attributes = 0x240; },  // a kernel handle
+        [](KeyName& k) { k.attributes.Attributes = 0x40; },   // a handle user mode can reach
         [](KeyName& k) { k.attributes.SecurityDescriptor = &k; },
         [](KeyName& k) { k.name.Length = 7; },
         [](KeyName& k) { k.name.MaximumLength = 2; },

@@ -38,9 +38,10 @@ TEST_P(Failures, LeaveTheDeviceInLoaderModeAndReportOnlyTheirOwnMessages)
     const std::vector<uint8_t> identityBefore = hardware->readMemory(identityPage(c.loaderProductId), 512);
     if (c.world) c.world(image);
 
-    sim::LoaderModeDevice& loader = run(hardware, arrival, [fails = c.descriptorFails](sim::LoaderModeDevice& device) {
-        device.failDescriptor = fails;
-    });
+    sim::LoaderModeDevice& loader =
+        run(hardware, arrival, [fails = c.descriptorFails](sim::LoaderModeDevice& device) {
+            device.failDescriptor = fails;
+        });
 
     EXPECT_EQ(requestLines(*hardware), c.requests);
     EXPECT_EQ(logLines(), c.log);
@@ -80,6 +81,13 @@ DeviceFault corruptRead(uint16_t address)
         options.faults.readCorruptions.back().address = address;
         options.faults.readCorruptions.back().xorMask = 0x10;
     };
+}
+
+// The device's reads: 1 to 3 the identity, 4 to 11 block 0, 12 to 19 the
+// partial block (the last one 40 bytes). A short read reports success.
+DeviceFault shortRead(uint64_t read, uint32_t bytes)
+{
+    return [read, bytes](sim::EmulatedDeviceOptions& options) { options.faults.shortReads.push_back({read, bytes}); };
 }
 
 // Read 1 is the header's; the blocks follow from read 2.
@@ -135,6 +143,22 @@ const FailureCase kFailureCases[] = {
              blockRequests(0x0600, 512)}),
      {verificationFailed(421, 2), updateFailed(-50152)}, 2048},
     {"PartialBlockDiffers", corruptRead(0x0400 + 487), {}, kProgrammed,
+     {verificationFailed(436, 1), updateFailed(-50152)}},
+    {"FirstByteOfABlockDiffers", corruptRead(0x0200), {}, joined({kIdentity, kErase, kBlock0}),
+     {verificationFailed(421, 0), updateFailed(-50152)}},
+    // A read-back that delivers less than asked never verifies, although the
+    // block's own bytes were the last to pass through the transfer buffer.
+    {"BlockFirstReadBackDeliversNothing", shortRead(4, 0), {}, joined({kIdentity, kErase, kBlock0}),
+     {verificationFailed(421, 0), updateFailed(-50152)}},
+    {"BlockMiddleReadBackEndsEarly", shortRead(8, 32), {}, joined({kIdentity, kErase, kBlock0}),
+     {verificationFailed(421, 0), updateFailed(-50152)}},
+    {"BlockLastReadBackLacksOneByte", shortRead(11, 63), {}, joined({kIdentity, kErase, kBlock0}),
+     {verificationFailed(421, 0), updateFailed(-50152)}},
+    {"PartialBlockFirstReadBackDeliversNothing", shortRead(12, 0), {}, kProgrammed,
+     {verificationFailed(436, 1), updateFailed(-50152)}},
+    {"PartialBlockMiddleReadBackEndsEarly", shortRead(15, 1), {}, kProgrammed,
+     {verificationFailed(436, 1), updateFailed(-50152)}},
+    {"PartialBlockLastReadBackLacksOneByte", shortRead(19, 39), {}, kProgrammed,
      {verificationFailed(436, 1), updateFailed(-50152)}},
     {"MarkerWriteRefused", stallRequest(24), {}, joined({kProgrammed, {"write 0x0206 2 failed"}}),
      {updateFailed(sim::kHostTransferStalled)}},

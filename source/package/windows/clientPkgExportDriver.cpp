@@ -109,6 +109,10 @@ extern "C" NTSTATUS DllUnload()
 {
     tStatus status = 0;
     libUnregisterModuleWithKARVEL(&gLibModuleInfo, status);
+    // A host that unloads without stopping the module first would leave its
+    // listeners calling into code that is gone: stop the device work here,
+    // as ssMain(1) would have, before the unload's own static stop.
+    if (gModuleDeviceTable != nullptr) stopDeviceWork();
     stopStaticObjects();
     logPackageEvent(1);
     return kStatusSuccess;

@@ -5,12 +5,29 @@
 
 #include "../../moduleMemory.h"
 
-// Not noexcept: it must match the implicit declaration on both targets.
-// The module itself never allocates with a plain new.
-void* operator new(size_t size)
+// noexcept, because it returns null when the host has no memory: only for an
+// allocation function that cannot throw does a new-expression test the result
+// before it constructs. The redeclaration differs from the implicit one;
+// GCC and clang for the driver's target take it (the latter with a warning of
+// Microsoft compatibility), clang for Linux refuses it, and there the module
+// keeps the implicit form and uses no plain new-expression.
+#if defined(__clang__) && !defined(_MSC_VER)
+#define MODULE_NEW_NOEXCEPT
+#else
+#define MODULE_NEW_NOEXCEPT noexcept
+#endif
+
+#if defined(__clang__)
+#pragma clang diagnostic push
+#pragma clang diagnostic ignored "-Wmicrosoft-exception-spec"
+#endif
+void* operator new(size_t size) MODULE_NEW_NOEXCEPT
 {
     return allocateFromHost(size);
 }
+#if defined(__clang__)
+#pragma clang diagnostic pop
+#endif
 
 void operator delete(void* pointer) noexcept
 {
