@@ -139,5 +139,16 @@ NTSTATUS ZwSetInformationFile(HANDLE fileHandle, IO_STATUS_BLOCK* ioStatus, void
                               uint32_t length, int informationClass);
 void RtlInitUnicodeString(UNICODE_STRING* destination, const WCHAR* source);
 void RtlCopyUnicodeString(UNICODE_STRING* destination, const UNICODE_STRING* source);
+#if defined(_WIN32)
 WCHAR* wcschr(const WCHAR* text, WCHAR character);
+#endif
 }
+
+#if !defined(_WIN32)
+// The kernel's wcschr works on UTF-16, glibc's on 32-bit wchar_t, and both are
+// the C symbol "wcschr". Declared with C linkage, ours would be a second C
+// function of that name beside glibc's, which clang refuses wherever <cwchar>
+// is also seen. As a C++ overload on char16_t bound to the same symbol it
+// stays the import "wcschr" that the kernel stand-in's version script exports.
+WCHAR* wcschr(const WCHAR* text, WCHAR character) __asm__("wcschr");
+#endif

@@ -77,7 +77,8 @@ DeviceTable::DeviceTable(tStatus& status)
     // status, so one device's failure neither stops the walk nor the table.
     for (uint32_t i = 0; i < list.count; ++i) {
         tStatus deviceStatus = 0;
-        deviceArrived(list.devices[i], deviceStatus);
+        // Named, not dispatched: the table is still being built.
+        DeviceTable::deviceArrived(list.devices[i], deviceStatus);
     }
 
     arrivalRecord = makeListenerRecord(kListenerArrival, query, static_cast<DeviceTableArrivalBase*>(this));

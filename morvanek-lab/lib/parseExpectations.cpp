@@ -131,7 +131,7 @@ Expectations parseExpectations(const JsonNode& node, const std::vector<DevicePla
     if (auto value = node.optionalField("findings")) expect.findings = parseLines(*value);
     if (auto value = node.optionalField("devices")) {
         for (const auto& [name, device] : value->members()) {
-            if (std::none_of(devices.begin(), devices.end(), [&](const DevicePlan& d) { return d.name == name; }))
+            if (std::none_of(devices.begin(), devices.end(), [&wanted = name](const DevicePlan& d) { return d.name == wanted; }))
                 device.fail(fmt::format("there is no device named \"{}\" in \"devices\"", name));
             expect.devices.push_back(parseDeviceExpectation(name, device));
         }

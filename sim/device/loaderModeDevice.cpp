@@ -7,7 +7,7 @@
 
 namespace sim {
 
-class LoaderModeDevice::Stream : public ControlStream {
+class LoaderModeDevice::Stream final : public ControlStream {
 public:
     explicit Stream(LoaderModeDevice& device) : device_(device) {}
 

@@ -13,7 +13,7 @@ constexpr uint32_t kUsbQueryValue = 0x20757362;
 constexpr int kMaxEventsPerDelivery = 1000;  // a runaway event loop stops here
 }  // namespace
 
-class DeviceTreeSim::Query : public DeviceQuery {
+class DeviceTreeSim::Query final : public DeviceQuery {
 public:
     Query(DeviceTreeSim& tree, uint32_t id) : tree_(tree), id_(id) {}
     void setAttribute(uint32_t id, const void* value, tStatus& status) override

@@ -97,7 +97,7 @@ struct TreeFaults {
     bool removeListener = false;
 };
 
-class DeviceTreeSim : public iDeviceTree {
+class DeviceTreeSim final : public iDeviceTree {
 public:
     DeviceTreeSim();
     ~DeviceTreeSim();

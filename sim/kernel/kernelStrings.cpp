@@ -33,7 +33,8 @@ extern "C" void RtlCopyUnicodeString(UNICODE_STRING* destination, const UNICODE_
     if (bytes + sizeof(WCHAR) <= destination->MaximumLength) destination->Buffer[bytes / sizeof(WCHAR)] = 0;
 }
 
-extern "C" WCHAR* wcschr(const WCHAR* text, WCHAR character)
+// Bound to the C symbol "wcschr" by its declaration in ntkernel.h.
+WCHAR* wcschr(const WCHAR* text, WCHAR character)
 {
     for (;; ++text) {
         if (*text == character) return const_cast<WCHAR*>(text);
