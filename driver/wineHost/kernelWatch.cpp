@@ -88,13 +88,18 @@ LONG fileCallFault(std::vector<KernelFaults::FileCallFault>& faults, const std::
     return 0;
 }
 
+// Every fault of the key or value counts the call, as the stand-in counts the
+// calls of a key or value once; the first that applies to this call wins.
 LONG keyFault(const std::wstring& key, const std::wstring* value)
 {
-    for (const KernelFaults::KeyFault& fault : gFaults.keys) {
+    LONG status = 0;
+    for (KernelFaults::KeyFault& fault : gFaults.keys) {
         if (fault.query != (value != nullptr) || folded(fault.keyPath) != folded(key)) continue;
-        if (value == nullptr || folded(fault.valueName) == folded(*value)) return fault.status;
+        if (value != nullptr && folded(fault.valueName) != folded(*value)) continue;
+        ++fault.seen;
+        if (status == 0 && (fault.number == 0 || fault.seen == fault.number)) status = fault.status;
     }
-    return 0;
+    return status;
 }
 
 std::wstring textOf(const CountedText* text)

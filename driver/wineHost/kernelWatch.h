@@ -20,6 +20,8 @@ struct KernelFaults {
         std::wstring valueName;  // empty with !query
         bool query = false;      // the value's query fails; otherwise the key's creation
         LONG status = 0;
+        uint64_t number = 0;  // 0: every call; N: only the Nth call of that key or value
+        uint64_t seen = 0;    // calls of that key or value so far
     };
     std::vector<KeyFault> keys;
     LONG everyRead = 0;

@@ -173,6 +173,7 @@ std::vector<uint8_t> prepareKernel(bridge::Reader& in)
         fault.query = in.u32() != 0;
         fault.valueName = readText16(in);
         fault.status = static_cast<LONG>(in.u32());
+        fault.number = in.u64();
         faults.keys.push_back(fault);
     }
     faults.everyRead = static_cast<LONG>(in.u32());

@@ -321,6 +321,7 @@ void WindowsModule::prepareKernel(const Scenario& scenario)
         out.u32(fault.valueName ? 1 : 0);
         writeText16(out, sim::utf8ToUtf16(fault.valueName.value_or("")));
         out.u32(static_cast<uint32_t>(fault.status));
+        out.u64(fault.number);
     }
     const FileFaultPlan& files = scenario.fileFaults;
     out.u32(static_cast<uint32_t>(files.everyRead));
