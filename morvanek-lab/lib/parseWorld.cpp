@@ -96,6 +96,8 @@ std::string driveRelativePath(const JsonNode& node, const std::string& raw)
     if (path.size() >= 2 && path[1] == ':')
         node.fail("a file name inside a drive is given without its drive letter (\"WINDOWS\\\\system32\\\\...\")");
     if (path.empty()) node.fail("empty file name");
+    // A trailing separator names a folder, which the lab cannot write as a file.
+    if (path.back() == '\\') node.fail("a file name may not end in \"\\\" or \"/\"");
     if (path.size() > kMaxDrivePathBytes)
         node.fail(fmt::format("a path of {} bytes; the lab takes paths of at most {} bytes inside a drive", path.size(),
                               kMaxDrivePathBytes));

@@ -54,6 +54,8 @@ TEST(MalformedScenario, IsRefusedNamingThePlaceAndTheProblem)
         {R"({"drives": {"C": {"files": {"a.bin": {"hex": "00", "text": "x"}}}}})",
          "/drives/C/files/a.bin", "exactly one of"},
         {R"({"drives": {"C": {"files": {"..\\a.bin": {"hex": "00"}}}}})", "/drives/C/files/..\\a.bin", "\"..\""},
+        {R"({"drives": {"C": {"files": {"WINDOWS\\syst/": {"hex": "00"}}}}})", "/drives/C/files/WINDOWS\\syst~1",
+         "may not end in"},
         {R"({"fileFaults": {"failOpen": [{"status": -1}]}})", "/fileFaults/failOpen/0", "missing field \"number\""},
         {R"({"fileFaults": {"failOpen": [{"number": 0, "status": -1}]}})", "/fileFaults/failOpen/0/number",
          "calls count from 1"},
