@@ -5,9 +5,9 @@
 
 #include "../../moduleMemory.h"
 
-// noexcept, because it returns null when the host has no memory: only for an
-// allocation function that cannot throw does a new-expression test the result
-// before it constructs. The redeclaration differs from the implicit one;
+// noexcept, because it returns null when the host has no memory: only for a
+// noexcept allocation function does a new-expression test the result before
+// it constructs. The redeclaration differs from the implicit one;
 // GCC and clang for the driver's target take it (the latter with a warning of
 // Microsoft compatibility), clang for Linux refuses it, and there the module
 // keeps the implicit form and uses no plain new-expression.
@@ -19,7 +19,8 @@
 
 #if defined(__clang__)
 #pragma clang diagnostic push
-#pragma clang diagnostic ignored "-Wmicrosoft-exception-spec"
+// Only this one declaration: the Microsoft-compatibility warning on it.
+#pragma clang diagnostic ignored "-Wmicrosoft"
 #endif
 void* operator new(size_t size) MODULE_NEW_NOEXCEPT
 {
