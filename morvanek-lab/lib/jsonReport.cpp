@@ -3,6 +3,7 @@
 #include "busTimeline.h"
 #include "deviceStory.h"
 #include "reports.h"
+#include "requestJson.h"
 
 namespace lab {
 
@@ -49,17 +50,8 @@ json stepJson(const StepRecord& step)
 
 json requestJson(const sim::RequestRecord& request, int update)
 {
-    json out = {{"sequence", request.sequence},
-                {"update", update + 1},
-                {"kind", sim::requestKindName(request.kind)},
-                {"bmRequestType", fmt::format("0x{:02X}", request.bmRequestType)},
-                {"bRequest", fmt::format("0x{:02X}", request.bRequest)},
-                {"wValue", hex16(request.wValue)},
-                {"wIndex", hex16(request.wIndex)},
-                {"length", request.length},
-                {"outcome", request.outcome},
-                {"text", requestText(request)}};
-    if (!request.data.empty()) out["data"] = hexBytesText(request.data);
+    json out = requestRecordJson(request);
+    out["update"] = update + 1;
     return out;
 }
 

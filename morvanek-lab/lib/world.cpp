@@ -5,6 +5,7 @@
 
 #include <fmt/format.h>
 
+#include "scenarioDevice.h"
 #include "scenarioError.h"
 #include "windowsModule.h"
 #include "regfile/registryText.h"
@@ -186,14 +187,7 @@ void World::buildDevices()
 {
     for (size_t i = 0; i < scenario_.devices.size(); ++i) {
         const DevicePlan& plan = scenario_.devices[i];
-        sim::EmulatedDeviceOptions options = plan.options;
-        options.trace = true;
-        options.identity.reset();
-        options.memory.clear();
-        if (!plan.flashDump.empty()) options.memory.push_back({0, plan.flashDump});
-        auto device = sim::makeEmulatedDevice(options);
-        if (plan.identity) device->setIdentity(*plan.identity);
-        for (const sim::MemoryBytes& bytes : plan.memory) device->flash.load(bytes.address, bytes.bytes);
+        auto device = makeScenarioDevice(plan);
         flashBefore_.push_back(device->readMemory(0, sim::FlashMemory::kSize));
         observer_.watch(*device, static_cast<int>(i));
         if (plan.present) device->plugIn(*sim::Host::get().tree(), plan.startsIn);

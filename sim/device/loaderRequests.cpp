@@ -95,6 +95,16 @@ tStatus PhysicalDevice::serve(nQVKORD100::tTransferParameterUSBControl& request,
     return outcome;
 }
 
+tStatus PhysicalDevice::outcomeBeforeData(const nQVKORD100::tTransferParameterUSBControl& request) const
+{
+    uint64_t sequence = requests_ + 1;
+    if (faults.unplugAtRequest != 0 && sequence >= faults.unplugAtRequest) return kHostDeviceGone;
+    RequestKind kind = classify(request.bmRequestType, request.bRequest);
+    if (faults.stallRequests.count(sequence) != 0 || faults.stallKinds.count(kind) != 0) return kHostTransferStalled;
+    if (!wellFormed(kind, request)) return kHostTransferStalled;
+    return 0;
+}
+
 tStatus PhysicalDevice::carryOut(nQVKORD100::tTransferParameterUSBControl& request, RequestRecord& record)
 {
     if (!wellFormed(record.kind, request)) return kHostTransferStalled;

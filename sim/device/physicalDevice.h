@@ -123,6 +123,11 @@ public:
     // verdict before the device sees the request (0 when it passes); the
     // result is the transfer's outcome.
     tStatus serve(nQVKORD100::tTransferParameterUSBControl& request, tStatus refusal);
+    // What the next request will come to by its setup packet alone, before
+    // any OUT data stage: a stall or a disconnect (0 when the data decides,
+    // or nothing stops it). A bus whose controller accepts an OUT data stage
+    // as it arrives must refuse such a request before it takes the data.
+    tStatus outcomeBeforeData(const nQVKORD100::tTransferParameterUSBControl& request) const;
 
     // Called by an enumeration as it is made and destroyed. Only one is live
     // at a time: one made while another stands for the device starts gone.

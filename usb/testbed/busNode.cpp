@@ -11,15 +11,15 @@
 #include <cstring>
 
 #include "emulatedBus.h"
+#include "usb/emulated/loaderControlRequest.h"
 
 namespace usbtestbed {
 
 namespace {
 
-constexpr int kSetupSize = 8;
+using usbemulated::kSetupSize;
 constexpr uint8_t kRequestTypeMask = 0x60;
 constexpr uint8_t kStandardType = 0x00;
-constexpr uint8_t kVendorType = 0x40;
 constexpr uint8_t kGetDescriptor = 6;
 constexpr uint8_t kSerialStringIndex = 3;
 
@@ -32,18 +32,6 @@ std::string hex(const std::vector<uint8_t>& bytes)
         text += pair;
     }
     return text;
-}
-
-int errnoOf(tStatus outcome)
-{
-    switch (outcome) {
-    case sim::kHostTransferStalled:
-        return EPIPE;
-    case sim::kHostDeviceGone:
-        return ESHUTDOWN;
-    default:
-        return EPROTO;
-    }
 }
 
 }  // namespace
@@ -73,9 +61,8 @@ Node::Node(EmulatedBus& bus, std::string path, int deviceAddress, std::shared_pt
       sysPath("/sys/devices/pci0000:00/usb1/" + busPath), bus_(bus), hardware_(std::move(hardware)),
       enumeration_(hardware_->current()), serial_(std::move(serial)), handler_(umockdev_ioctl_base_new())
 {
-    auto* enumerated = static_cast<sim::UsbDeviceSim*>(enumeration_);
-    vendorId_ = static_cast<uint16_t>(enumerated->getAttribute(1, nullptr));
-    productId_ = static_cast<uint16_t>(enumerated->getAttribute(2, nullptr));
+    vendorId_ = usbemulated::vendorIdOf(*enumeration_);
+    productId_ = usbemulated::productIdOf(*enumeration_);
     g_signal_connect(handler_, "handle-ioctl", G_CALLBACK(onIoctl), this);
     g_signal_connect(handler_, "client-vanished", G_CALLBACK(onVanished), this);
     worker_ = std::thread([this] { work(); });
@@ -339,44 +326,22 @@ int Node::standardRequest(const uint8_t* setup, uint8_t* data, int& actualLength
 
 int Node::vendorRequest(const uint8_t* setup, uint8_t* data, int& actualLength)
 {
-    if ((setup[0] & kRequestTypeMask) != kVendorType) return -EPIPE;
-    nQVKORD100::tTransferParameterUSBControl request;
-    request.bmRequestType = setup[0];
-    request.bRequest = setup[1];
-    request.wValue = static_cast<uint16_t>(setup[2] | setup[3] << 8);
-    request.wIndex = static_cast<uint16_t>(setup[4] | setup[5] << 8);
-    request.length = static_cast<uint16_t>(setup[6] | setup[7] << 8);
-    request.data = request.length != 0 ? data : nullptr;
-
-    std::chrono::microseconds spent{0};
-    tStatus outcome;
-    bool stillHere;
-    size_t crossed = request.length;  // bytes of the data stage that crossed the bus
+    usbemulated::ControlOutcome outcome;
     {
         std::lock_guard<std::mutex> deviceLock(bus_.deviceMutex);
-        // Only the loader speaks the protocol; the product's firmware stalls it.
-        if (hardware_->current() != enumeration_ || dynamic_cast<sim::LoaderModeDevice*>(enumeration_) == nullptr)
-            return -EPIPE;
-        std::chrono::microseconds before = hardware_->elapsed;
-        outcome = hardware_->serve(request, 0);
-        spent = hardware_->elapsed - before;
-        stillHere = hardware_->current() == enumeration_;
-        // A device may end an IN data stage early; its trace holds what it sent.
-        if ((request.bmRequestType & 0x80) != 0 && hardware_->traceEnabled && !hardware_->trace.empty())
-            crossed = hardware_->trace.back().data.size();
+        outcome = usbemulated::serveVendorRequest(*hardware_, enumeration_, setup, data);
     }
-    if (bus_.timeScale > 0 && spent.count() > 0)
-        std::this_thread::sleep_for(std::chrono::duration<double, std::micro>(spent.count() * bus_.timeScale));
-    if (!stillHere) {
-        if (outcome < 0) {
+    if (bus_.timeScale > 0 && outcome.spent.count() > 0)
+        std::this_thread::sleep_for(std::chrono::duration<double, std::micro>(outcome.spent.count() * bus_.timeScale));
+    if (outcome.leftTheBus) {
+        if (outcome.error != 0) {
             bus_.disconnect(busPath);
         } else {
             bus_.reenumerate(busPath);
         }
     }
-    if (outcome < 0) return -errnoOf(outcome);
-    actualLength = static_cast<int>(crossed);
-    return 0;
+    actualLength = outcome.actualLength;
+    return -outcome.error;
 }
 
 }  // namespace usbtestbed

@@ -1,0 +1,175 @@
+#include "guestMachine.h"
+
+#include <sys/wait.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+
+namespace usb_kernel_testing {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+std::string quoted(const std::string& text)
+{
+    std::string out = "'";
+    for (char c : text) out += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    return out + "'";
+}
+
+struct CommandResult {
+    int exitCode = -1;
+    std::string out;
+};
+
+CommandResult runCommand(const std::string& command)
+{
+    CommandResult result;
+    FILE* pipe = popen(command.c_str(), "r");
+    if (pipe == nullptr) return result;
+    char buffer[4096];
+    size_t got;
+    while ((got = fread(buffer, 1, sizeof buffer, pipe)) > 0) result.out.append(buffer, got);
+    int status = pclose(pipe);
+    result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    return result;
+}
+
+std::string readText(const fs::path& path)
+{
+    std::ifstream in(path);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+std::string guestFolder()
+{
+    return std::string(MORVANEK_BINARY_DIR) + "/guest";
+}
+
+// The job the guest runs: the gadgets, then morvanek-usb once the devices
+// have enumerated, then the gadgets stopped so they write their reports.
+std::string jobScript(const std::string& scenarioFile, const std::vector<GadgetPlan>& gadgets,
+                      const std::string& usbCommand)
+{
+    std::ostringstream job;
+    job << "set -u\ncd \"$(dirname \"$0\")\"\npids=()\n";
+    for (size_t i = 0; i < gadgets.size(); ++i) {
+        job << quoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << quoted(scenarioFile) << " --device "
+            << quoted(gadgets[i].device) << " --udc dummy_udc." << i << " --name device" << i;
+        if (!gadgets[i].serial.empty()) job << " --serial " << quoted(gadgets[i].serial);
+        job << " --report gadget-" << i << ".json --ready ready-" << i << " 2>gadget-" << i << ".err &\n";
+        job << "pids+=($!)\n";
+    }
+    job << "for i in $(seq 200); do\n"
+        << "  ready=$(ls ready-* 2>/dev/null | wc -l)\n"
+        << "  devices=$(grep -l '^5c1d$' /sys/bus/usb/devices/*/idVendor 2>/dev/null | wc -l)\n"
+        << "  [ \"$ready\" -eq " << gadgets.size() << " ] && [ \"$devices\" -eq " << gadgets.size()
+        << " ] && break\n"
+        << "  sleep 0.1\n"
+        << "done\n"
+        << "udevadm settle --timeout=20\n"
+        << usbCommand << " >usb.out 2>usb.err\n"
+        << "echo $? >usb.exit\n"
+        << "kill -TERM \"${pids[@]}\"\n"
+        << "wait\n";
+    return job.str();
+}
+
+}  // namespace
+
+std::vector<nlohmann::json> GuestRun::eventsOf(const std::string& kind) const
+{
+    std::vector<nlohmann::json> found;
+    for (const auto& event : events) {
+        if (event.value("event", "") == kind) found.push_back(event);
+    }
+    return found;
+}
+
+std::string GuestMachine::prepare()
+{
+    static const std::string verdict = [] {
+        CommandResult prepared = runCommand(quoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/prepareGuest") + " " +
+                                            quoted(guestFolder()) + " 2>&1");
+        if (prepared.exitCode == 0) return std::string();
+        if (prepared.exitCode == 77) return prepared.out.empty() ? std::string("skipped") : prepared.out;
+        throw std::runtime_error("the guest could not be prepared: " + prepared.out);
+    }();
+    return verdict;
+}
+
+GuestRun GuestMachine::run(const std::string& jobName, const std::string& scenarioFile,
+                           const std::vector<GadgetPlan>& gadgets, const std::vector<std::string>& usbArguments)
+{
+    fs::path folder = fs::path(MORVANEK_BINARY_DIR) / "usbKernel" / jobName;
+    fs::remove_all(folder);
+    fs::create_directories(folder);
+
+    CommandResult exported = runCommand(quoted(MORVANEK_LAB_EXECUTABLE) + " export " + quoted(scenarioFile) + " " +
+                                        quoted((folder / "world").string()) + " 2>/dev/null");
+    if (exported.exitCode != 0) throw std::runtime_error("the lab could not export " + scenarioFile);
+    std::string worldArguments = exported.out.substr(0, exported.out.find('\n'));
+
+    std::string usbCommand = quoted(MORVANEK_USB_EXECUTABLE) + " once --json --no-progress " + worldArguments;
+    for (const std::string& argument : usbArguments) usbCommand += " " + quoted(argument);
+    std::ofstream(folder / "job.sh") << jobScript(scenarioFile, gadgets, usbCommand);
+
+    CommandResult guest = runCommand(quoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/runGuest") + " " +
+                                     quoted(guestFolder()) + " " + quoted(folder.string()) + " " +
+                                     quoted((folder / "job.sh").string()) + " " + std::to_string(gadgets.size()) +
+                                     " 2>&1");
+    GuestRun run;
+    run.log = guest.out + readText(folder / "job.log") + readText(folder / "usb.err");
+    for (size_t i = 0; i < gadgets.size(); ++i) run.log += readText(folder / ("gadget-" + std::to_string(i) + ".err"));
+    if (guest.exitCode != 0) throw std::runtime_error("the guest did not run the job:\n" + run.log);
+
+    std::string exitText = readText(folder / "usb.exit");
+    run.usbExitCode = exitText.empty() ? -1 : std::stoi(exitText);
+    run.usbErrors = readText(folder / "usb.err");
+    std::istringstream lines(readText(folder / "usb.out"));
+    for (std::string line; std::getline(lines, line);) {
+        if (!line.empty()) run.events.push_back(nlohmann::json::parse(line, nullptr, false));
+    }
+    for (size_t i = 0; i < gadgets.size(); ++i) {
+        std::string report = readText(folder / ("gadget-" + std::to_string(i) + ".json"));
+        run.gadgets[gadgets[i].device] = nlohmann::json::parse(report, nullptr, false);
+    }
+    return run;
+}
+
+std::map<std::string, nlohmann::json> GuestMachine::labTraces(const std::string& scenarioFile)
+{
+    CommandResult lab =
+        runCommand(quoted(MORVANEK_LAB_EXECUTABLE) + " run --trace --json " + quoted(scenarioFile) + " 2>/dev/null");
+    nlohmann::json report = nlohmann::json::parse(lab.out, nullptr, false);
+    std::map<std::string, nlohmann::json> traces;
+    if (report.is_discarded()) return traces;
+    for (const auto& device : report["scenarios"][0]["devices"]) traces[device["name"]] = device["trace"];
+    return traces;
+}
+
+std::string traceDifference(const nlohmann::json& expected, const nlohmann::json& seen)
+{
+    auto summary = [](const nlohmann::json& request) {
+        return request.value("text", "?") + " outcome " + std::to_string(request.value("outcome", 0));
+    };
+    size_t count = std::max(expected.size(), seen.size());
+    for (size_t i = 0; i < count; ++i) {
+        if (i >= expected.size()) return "an extra request: " + summary(seen[i]);
+        if (i >= seen.size()) return "missing request: " + summary(expected[i]);
+        for (const char* field : {"bmRequestType", "bRequest", "wValue", "wIndex", "length", "outcome", "data"}) {
+            if (expected[i].value(field, nlohmann::json()) != seen[i].value(field, nlohmann::json()))
+                return "request " + std::to_string(i + 1) + ": expected " + summary(expected[i]) + ", saw " +
+                       summary(seen[i]) + " (" + field + " differs)";
+        }
+    }
+    return "";
+}
+
+}  // namespace usb_kernel_testing

@@ -1,0 +1,50 @@
+// A virtual machine with a real kernel USB stack for morvanek-usb's tests:
+// Debian's kernel under qemu, the emulated devices of a lab scenario behind
+// FunctionFS gadgets on dummy_hcd, and morvanek-usb on the host side of the
+// same controllers, all in one guest that runs the programs built here.
+#pragma once
+
+#include <map>
+#include <string>
+#include <vector>
+
+#include <nlohmann/json.hpp>
+
+namespace usb_kernel_testing {
+
+struct GadgetPlan {
+    std::string device;  // the scenario's device
+    std::string serial;  // its USB serial-number string
+};
+
+struct GuestRun {
+    int usbExitCode = -1;
+    std::vector<nlohmann::json> events;  // morvanek-usb's JSON lines
+    std::string usbErrors;
+    std::map<std::string, nlohmann::json> gadgets;  // each device's gadget report, by device name
+    std::string log;                                // what the job and the guest said, for failures
+
+    std::vector<nlohmann::json> eventsOf(const std::string& kind) const;
+};
+
+class GuestMachine {
+  public:
+    // Prepares the guest once per test program; an empty answer means ready,
+    // otherwise it says why the machine cannot run one (the tests skip).
+    static std::string prepare();
+
+    // Exports the scenario's world with the lab, boots the guest with one
+    // controller per gadget, serves the devices and runs `morvanek-usb once`
+    // with the world and the extra arguments.
+    static GuestRun run(const std::string& jobName, const std::string& scenarioFile,
+                        const std::vector<GadgetPlan>& gadgets, const std::vector<std::string>& usbArguments = {});
+
+    // The lab's own run of the scenario: each device's trace, by device name.
+    static std::map<std::string, nlohmann::json> labTraces(const std::string& scenarioFile);
+};
+
+// The first difference between two traces (the lab's JSON form), or empty
+// when they agree request for request: kind, addresses, length, outcome, data.
+std::string traceDifference(const nlohmann::json& expected, const nlohmann::json& seen);
+
+}  // namespace usb_kernel_testing

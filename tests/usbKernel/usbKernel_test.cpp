@@ -1,0 +1,165 @@
+// morvanek-usb against a real kernel USB stack: Debian's kernel in qemu, the
+// lab's emulated devices behind FunctionFS gadgets on dummy_hcd, the program
+// on the controller's host side through libusb, usbfs and udev as on a
+// workstation. Each device must be asked exactly what the lab's host asks it
+// for the same scenario.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+
+#include "guestMachine.h"
+
+namespace usb_kernel_testing {
+namespace {
+
+const std::string kScenarios = std::string(MORVANEK_SOURCE_DIR) + "/tests/usbKernel/scenarios/";
+const std::string kLabScenarios = std::string(MORVANEK_SOURCE_DIR) + "/morvanek-lab/scenarios/";
+
+class KernelUsb : public testing::Test {
+  protected:
+    void SetUp() override
+    {
+        std::string why = GuestMachine::prepare();
+        if (!why.empty()) GTEST_SKIP() << why;
+    }
+
+    static std::string jobName()
+    {
+        const testing::TestInfo* test = testing::UnitTest::GetInstance()->current_test_info();
+        std::string name = std::string(test->test_suite_name()) + "-" + test->name();
+        std::replace(name.begin(), name.end(), '/', '-');
+        return name;
+    }
+
+    // Every served device's requests agree with the lab's run of the scenario.
+    static void expectLabTraces(const std::string& scenario, const GuestRun& run)
+    {
+        std::map<std::string, nlohmann::json> lab = GuestMachine::labTraces(scenario);
+        for (const auto& [device, report] : run.gadgets) {
+            ASSERT_FALSE(report.is_discarded()) << device << " wrote no report\n" << run.log;
+            ASSERT_TRUE(lab.count(device)) << "the lab ran no device " << device;
+            EXPECT_EQ(traceDifference(lab[device], report["trace"]), "") << device << "\n" << run.log;
+        }
+    }
+
+    static std::vector<std::string> bus(const GuestRun& run, const std::string& device)
+    {
+        return run.gadgets.at(device)["bus"].get<std::vector<std::string>>();
+    }
+};
+
+struct UpdateCase {
+    const char* name;
+    const char* scenario;  // in the lab's shipped scenarios
+    const char* device;
+    const char* loaderIds;
+    const char* productIds;
+};
+
+class KernelUsbUpdate : public KernelUsb, public testing::WithParamInterface<UpdateCase> {};
+
+// A whole update, and the restart seen as the kernel reports it: the loader
+// leaves the bus and the product enumerates in its place.
+TEST_P(KernelUsbUpdate, ProgramsTheDeviceAndSeesItComeBackAsTheProduct)
+{
+    const UpdateCase& param = GetParam();
+    std::string scenario = kLabScenarios + param.scenario;
+    GuestRun run = GuestMachine::run(jobName(), scenario, {{param.device, "MV0001"}});
+
+    EXPECT_EQ(run.usbExitCode, 0) << run.log;
+    ASSERT_EQ(run.eventsOf("update").size(), 1u) << run.log;
+    EXPECT_EQ(run.eventsOf("update")[0]["outcome"], "updated");
+    EXPECT_EQ(run.eventsOf("left").size(), 1u) << run.log;
+    EXPECT_EQ(bus(run, param.device), (std::vector<std::string>{std::string("connected ") + param.loaderIds,
+                                                                "disconnected (restart)",
+                                                                std::string("connected ") + param.productIds}));
+    const nlohmann::json& gadget = run.gadgets.at(param.device);
+    EXPECT_EQ(gadget["mode"], "product");
+    EXPECT_EQ(gadget["markerInPlace"], true);
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"], nlohmann::json::array());
+    expectLabTraces(scenario, run);
+}
+
+INSTANTIATE_TEST_SUITE_P(BothLoaders, KernelUsbUpdate,
+                         testing::Values(UpdateCase{"FirstLoader", "demo.json", "bench-left", "5C1D:4A10", "5C1D:4B01"},
+                                         UpdateCase{"SecondLoaderRepairingItsIdentity", "demo.json", "bench-right",
+                                                    "5C1D:4A20", "5C1D:4B02"}),
+                         [](const testing::TestParamInfo<UpdateCase>& info) { return std::string(info.param.name); });
+
+struct FaultCase {
+    const char* name;
+    const char* device;  // in faults-while-programming.json
+    bool staysOnTheBus;
+};
+
+class KernelUsbFault : public KernelUsb, public testing::WithParamInterface<FaultCase> {};
+
+// A stall or a disconnect in the middle of programming: the update fails,
+// the device is left in its loader (or gone), nothing is left allocated, and
+// the device saw the same requests as in the lab, up to and including the one
+// that failed.
+TEST_P(KernelUsbFault, FailsTheUpdateAndLeavesTheDeviceInItsLoader)
+{
+    const FaultCase& param = GetParam();
+    std::string scenario = kScenarios + "faults-while-programming.json";
+    GuestRun run = GuestMachine::run(jobName(), scenario, {{param.device, ""}});
+
+    EXPECT_EQ(run.usbExitCode, 1) << run.log;
+    ASSERT_EQ(run.eventsOf("update").size(), 1u) << run.log;
+    EXPECT_EQ(run.eventsOf("update")[0]["outcome"], "failed");
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"], nlohmann::json::array());
+    const nlohmann::json& gadget = run.gadgets.at(param.device);
+    EXPECT_EQ(gadget["markerInPlace"], false);
+    EXPECT_EQ(gadget["mode"], param.staysOnTheBus ? "loader" : "unplugged");
+    std::vector<std::string> expectedBus = {"connected 5C1D:4A10"};
+    if (!param.staysOnTheBus) expectedBus.push_back("disconnected");
+    EXPECT_EQ(bus(run, param.device), expectedBus);
+    EXPECT_EQ(gadget["notes"].size(), param.staysOnTheBus ? 0u : 1u) << gadget["notes"].dump();
+    expectLabTraces(scenario, run);
+}
+
+INSTANTIATE_TEST_SUITE_P(WhileProgramming, KernelUsbFault,
+                         testing::Values(FaultCase{"StallOnAWrite", "stalled-write", true},
+                                         FaultCase{"StallOnAnErase", "stalled-erase", true},
+                                         FaultCase{"DisconnectOnARead", "gone-at-read", false},
+                                         FaultCase{"DisconnectOnAWrite", "gone-at-write", false}),
+                         [](const testing::TestParamInfo<FaultCase>& info) { return std::string(info.param.name); });
+
+// Two devices of one product at once, each on a bus of its own: both are
+// updated side by side from the one image file.
+TEST_F(KernelUsb, UpdatesTwoDevicesOfOneProductAtOnce)
+{
+    std::string scenario = kScenarios + "two-of-one-product.json";
+    GuestRun run = GuestMachine::run(jobName(), scenario, {{"left", "MV0111"}, {"right", "MV0222"}});
+
+    EXPECT_EQ(run.usbExitCode, 0) << run.log;
+    auto updates = run.eventsOf("update");
+    ASSERT_EQ(updates.size(), 2u) << run.log;
+    for (const auto& update : updates) EXPECT_EQ(update["outcome"], "updated") << update.dump();
+    for (const char* device : {"left", "right"}) {
+        EXPECT_EQ(run.gadgets.at(device)["mode"], "product") << device;
+        EXPECT_EQ(bus(run, device).back(), "connected 5C1D:4B01") << device;
+    }
+    expectLabTraces(scenario, run);
+}
+
+// Selection by USB serial number: only the device named is asked anything.
+TEST_F(KernelUsb, UpdatesOnlyTheDeviceWithTheSerialNumberGiven)
+{
+    std::string scenario = kScenarios + "two-of-one-product.json";
+    GuestRun run =
+        GuestMachine::run(jobName(), scenario, {{"left", "MV0111"}, {"right", "MV0222"}}, {"--serial", "MV0222"});
+
+    EXPECT_EQ(run.usbExitCode, 0) << run.log;
+    auto updates = run.eventsOf("update");
+    ASSERT_EQ(updates.size(), 1u) << run.log;
+    EXPECT_EQ(updates[0]["device"]["serial"], "MV0222");
+    EXPECT_EQ(run.gadgets.at("left")["trace"], nlohmann::json::array());
+    EXPECT_EQ(run.gadgets.at("left")["mode"], "loader");
+    EXPECT_EQ(run.gadgets.at("right")["mode"], "product");
+    std::map<std::string, nlohmann::json> lab = GuestMachine::labTraces(scenario);
+    EXPECT_EQ(traceDifference(lab["right"], run.gadgets.at("right")["trace"]), "") << run.log;
+}
+
+}  // namespace
+}  // namespace usb_kernel_testing
