@@ -134,9 +134,16 @@ TEST_P(ExportedScenario, ReadsBackAsTheWorldTheLabBuilds)
 
 INSTANTIATE_TEST_SUITE_P(EveryShippedScenario, ExportedScenario, ::testing::ValuesIn(scenarioFilesToExport()),
                          [](const ::testing::TestParamInfo<std::string>& info) {
-                             std::string name = fs::path(info.param).stem().string();
-                             for (char& c : name) {
-                                 if (!std::isalnum(static_cast<unsigned char>(c))) c = '_';
+                             // "firmware-path-with-slashes" -> "FirmwarePathWithSlashes"
+                             std::string name;
+                             bool wordStarts = true;
+                             for (char c : fs::path(info.param).stem().string()) {
+                                 if (!std::isalnum(static_cast<unsigned char>(c))) {
+                                     wordStarts = true;
+                                     continue;
+                                 }
+                                 name += wordStarts ? static_cast<char>(std::toupper(static_cast<unsigned char>(c))) : c;
+                                 wordStarts = false;
                              }
                              return name;
                          });
