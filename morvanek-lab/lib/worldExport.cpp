@@ -1,8 +1,10 @@
 #include "worldExport.h"
 
 #include <algorithm>
+#include <cctype>
 #include <fstream>
 #include <random>
+#include <string_view>
 #include <system_error>
 
 #include <fmt/format.h>
@@ -150,14 +152,19 @@ WorldExport exportWorld(const Scenario& scenario, const fs::path& folder, bool f
     bool existed = fs::exists(target, error);
     if (existed && !fs::is_directory(target, error))
         throw CommandError(kExitScenarioInvalid, fmt::format("{} exists and is not a folder", target.string()));
-    if (existed && !force && !fs::is_empty(target, error)) {
+    bool empty = existed && fs::is_empty(target, error);
+    check(error, "read " + target.string());
+    if (existed && !force && !empty) {
         throw CommandError(kExitScenarioInvalid,
                            fmt::format("{} is not empty; --force replaces its registry.reg and drive-* folders",
                                        target.string()));
     }
     fs::path resolved = fs::weakly_canonical(target, error);
     for (const DrivePlan& drive : scenario.drives) {
-        if (drive.folder && isInside(resolved, fs::weakly_canonical(*drive.folder, error))) {
+        if (!drive.folder) continue;
+        std::error_code unresolved;
+        fs::path driveFolder = fs::weakly_canonical(*drive.folder, unresolved);
+        if (!unresolved && !driveFolder.empty() && isInside(resolved, driveFolder)) {
             throw CommandError(kExitScenarioInvalid,
                                fmt::format("{} lies inside drive {}'s folder {}, which is copied into it; export elsewhere",
                                            target.string(), drive.letter, drive.folder->string()));
@@ -178,9 +185,11 @@ WorldExport exportWorld(const Scenario& scenario, const fs::path& folder, bool f
     try {
         written = writeExport(scenario, staging);
         if (force) {
+            std::vector<fs::path> old;
             for (const auto& entry : fs::directory_iterator(target)) {
-                if (isExportPart(entry.path().filename())) fs::remove_all(entry.path());
+                if (isExportPart(entry.path().filename())) old.push_back(entry.path());
             }
+            for (const fs::path& path : old) fs::remove_all(path);
         }
         written.registryFile = target / kRegistryFileName;
         fs::rename(staging / kRegistryFileName, written.registryFile);
