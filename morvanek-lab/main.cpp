@@ -8,6 +8,7 @@
 
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
 #include <iostream>
 #include <string>
 #include <vector>
@@ -22,7 +23,9 @@
 #include "lib/pictures.h"
 #include "lib/reports.h"
 #include "lib/scenarioError.h"
+#include "lib/scenarioParser.h"
 #include "lib/sweep.h"
+#include "lib/worldExport.h"
 #include "source/versionServices.h"
 
 namespace {
@@ -31,7 +34,7 @@ constexpr const char* kExitCodes =
     "Exit codes: 0 success, 1 an expectation failed, 2 a scenario (or the command line) is invalid, "
     "3 the lab itself failed (for example, the module cannot be loaded).";
 
-const char* const kCommands[] = {"run", "demo", "sweep", "inspect"};
+const char* const kCommands[] = {"run", "demo", "sweep", "inspect", "export"};
 const char* const kInspectCommands[] = {"image", "identity"};
 
 struct CommonOptions {
@@ -177,6 +180,40 @@ int sweepScenario(const SweepCommand& command, const CommonOptions& common)
     return result.exitCode();
 }
 
+struct ExportCommand {
+    std::string file;
+    std::string folder;
+    bool force = false;
+};
+
+// Standard output: the morvanek-usb arguments (or, with --json, the one
+// document); standard error: a line per part a real machine cannot be given.
+int exportScenario(const ExportCommand& command, bool json)
+{
+    lab::Scenario scenario;
+    try {
+        scenario = command.file == lab::kStandardInput
+                       ? lab::loadScenarioStream(std::cin, "(standard input)", std::filesystem::current_path())
+                       : lab::loadScenarioFile(command.file);
+    } catch (const lab::ScenarioError& error) {
+        throw lab::CommandError(lab::kExitScenarioInvalid, std::string("invalid scenario: ") + error.what());
+    }
+    lab::WorldExport written = lab::exportWorld(scenario, command.folder, command.force);
+    for (const std::string& part : written.notExported) fmt::print(stderr, "morvanek-lab: not exported: {}\n", part);
+    if (json) {
+        nlohmann::json drives = nlohmann::json::object();
+        for (const auto& [letter, folder] : written.drives) drives[std::string(1, letter)] = folder.string();
+        nlohmann::json document = {{"registry", written.registryFile.string()},
+                                   {"drives", drives},
+                                   {"arguments", written.usbArguments()},
+                                   {"notExported", written.notExported}};
+        std::cout << document.dump(2, ' ', false, nlohmann::json::error_handler_t::replace) << "\n";
+    } else {
+        fmt::print("{}\n", written.usbArguments());
+    }
+    return lab::kExitSuccess;
+}
+
 // The first word that is not an option names the command; CLI11 would call a
 // mistyped one an unexpected argument, which does not help.
 std::string unknownCommand(int argc, char** argv)
@@ -191,7 +228,7 @@ std::string unknownCommand(int argc, char** argv)
         return false;
     };
     if (!known(argv[at], kCommands)) {
-        return fmt::format("unknown command \"{}\"; the commands are run, demo, sweep and inspect (morvanek-lab --help)",
+        return fmt::format("unknown command \"{}\"; the commands are run, demo, sweep, inspect and export (morvanek-lab --help)",
                            argv[at]);
     }
     if (std::strcmp(argv[at], "inspect") != 0) return {};
@@ -279,6 +316,16 @@ int main(int argc, char** argv)
     identity->add_flag("--json", inspect.json, "machine-readable output");
     identity->add_option("--module", inspect.modulePath, "the module to load");
 
+    ExportCommand exportCommand;
+    CLI::App* exportWorld = app.add_subcommand(
+        "export", "write a scenario's registry and drives into a folder, for morvanek-usb on a real machine");
+    exportWorld->add_option("scenario", exportCommand.file, "the scenario file (JSON); - reads it from standard input")
+        ->required();
+    exportWorld->add_option("folder", exportCommand.folder, "where registry.reg and the drive-* folders go")->required();
+    exportWorld->add_flag("--force", exportCommand.force,
+                          "write into a folder that is not empty, replacing its registry.reg and drive-* folders");
+    exportWorld->add_flag("--json", common.json, "write one machine-readable report, and nothing else, on standard output");
+
     try {
         app.parse(argc, argv);
     } catch (const CLI::CallForHelp& help) {
@@ -298,6 +345,7 @@ int main(int argc, char** argv)
         if (sweep->parsed()) return sweepScenario(sweepCommand, common);
         if (image->parsed()) return lab::inspectImage(inspect, stdout);
         if (identity->parsed()) return lab::inspectIdentity(inspect, stdout);
+        if (exportWorld->parsed()) return exportScenario(exportCommand, common.json);
     } catch (const lab::CommandError& error) {
         return reporter.fail(error.exitCode(), error.what());
     } catch (const std::exception& error) {

@@ -7,8 +7,8 @@
 
 #include "scenarioDevice.h"
 #include "scenarioError.h"
+#include "scenarioRegistry.h"
 #include "windowsModule.h"
-#include "regfile/registryText.h"
 #include "sim/kernel/simKernel.h"
 
 namespace lab {
@@ -169,11 +169,7 @@ std::filesystem::path World::faultFile(const CallFailurePlan& failure) const
 void World::buildRegistry()
 {
     auto& registry = sim::kernel::registry();
-    for (const auto& path : scenario_.registry.imports) sim::regfile::importRegistryFile(registry, path.string());
-    for (const RegistryKeyPlan& key : scenario_.registry.keys) {
-        registry.createKey(key.path);
-        for (const RegistryValuePlan& value : key.values) registry.setValue(key.path, value.name, value.type, value.data);
-    }
+    fillRegistry(registry, scenario_.registry);
     for (const RegistryFaultPlan& fault : scenario_.registry.faults) {
         if (fault.valueName) {
             registry.failQuery(fault.keyPath, *fault.valueName, fault.status, fault.number);
