@@ -92,6 +92,15 @@ std::vector<nlohmann::json> GuestRun::eventsOf(const std::string& kind) const
     return found;
 }
 
+std::vector<nlohmann::json> GuestRun::updates() const
+{
+    std::vector<nlohmann::json> found;
+    for (const auto& event : eventsOf("update")) {
+        if (event.value("outcome", "") != "ignored") found.push_back(event);
+    }
+    return found;
+}
+
 std::string GuestMachine::prepare()
 {
     static const std::string verdict = [] {

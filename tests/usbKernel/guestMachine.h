@@ -25,6 +25,8 @@ struct GuestRun {
     std::string log;                                // what the job and the guest said, for failures
 
     std::vector<nlohmann::json> eventsOf(const std::string& kind) const;
+    // The update events of loader-mode devices (a product that arrives is "ignored").
+    std::vector<nlohmann::json> updates() const;
 };
 
 class GuestMachine {

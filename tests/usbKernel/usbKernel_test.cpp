@@ -67,8 +67,8 @@ TEST_P(KernelUsbUpdate, ProgramsTheDeviceAndSeesItComeBackAsTheProduct)
     GuestRun run = GuestMachine::run(jobName(), scenario, {{param.device, "MV0001"}});
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
-    ASSERT_EQ(run.eventsOf("update").size(), 1u) << run.log;
-    EXPECT_EQ(run.eventsOf("update")[0]["outcome"], "updated");
+    ASSERT_EQ(run.updates().size(), 1u) << run.log;
+    EXPECT_EQ(run.updates()[0]["outcome"], "updated");
     EXPECT_EQ(run.eventsOf("left").size(), 1u) << run.log;
     EXPECT_EQ(bus(run, param.device), (std::vector<std::string>{std::string("connected ") + param.loaderIds,
                                                                 "disconnected (restart)",
@@ -105,8 +105,8 @@ TEST_P(KernelUsbFault, FailsTheUpdateAndLeavesTheDeviceInItsLoader)
     GuestRun run = GuestMachine::run(jobName(), scenario, {{param.device, ""}});
 
     EXPECT_EQ(run.usbExitCode, 1) << run.log;
-    ASSERT_EQ(run.eventsOf("update").size(), 1u) << run.log;
-    EXPECT_EQ(run.eventsOf("update")[0]["outcome"], "failed");
+    ASSERT_EQ(run.updates().size(), 1u) << run.log;
+    EXPECT_EQ(run.updates()[0]["outcome"], "failed");
     EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"], nlohmann::json::array());
     const nlohmann::json& gadget = run.gadgets.at(param.device);
     EXPECT_EQ(gadget["markerInPlace"], false);
@@ -133,7 +133,7 @@ TEST_F(KernelUsb, UpdatesTwoDevicesOfOneProductAtOnce)
     GuestRun run = GuestMachine::run(jobName(), scenario, {{"left", "MV0111"}, {"right", "MV0222"}});
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
-    auto updates = run.eventsOf("update");
+    auto updates = run.updates();
     ASSERT_EQ(updates.size(), 2u) << run.log;
     for (const auto& update : updates) EXPECT_EQ(update["outcome"], "updated") << update.dump();
     for (const char* device : {"left", "right"}) {
@@ -151,7 +151,7 @@ TEST_F(KernelUsb, UpdatesOnlyTheDeviceWithTheSerialNumberGiven)
         GuestMachine::run(jobName(), scenario, {{"left", "MV0111"}, {"right", "MV0222"}}, {"--serial", "MV0222"});
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
-    auto updates = run.eventsOf("update");
+    auto updates = run.updates();
     ASSERT_EQ(updates.size(), 1u) << run.log;
     EXPECT_EQ(updates[0]["device"]["serial"], "MV0222");
     EXPECT_EQ(run.gadgets.at("left")["trace"], nlohmann::json::array());
