@@ -54,13 +54,13 @@ std::string guestFolder()
 
 // The job the guest runs: the gadgets, then morvanek-usb once the devices
 // have enumerated, then the gadgets stopped so they write their reports.
-std::string jobScript(const std::string& scenarioFile, const std::vector<GadgetPlan>& gadgets,
-                      const std::string& usbCommand)
+std::string jobScript(const GuestJob& plan, const std::string& usbCommand)
 {
+    const std::vector<GadgetPlan>& gadgets = plan.gadgets;
     std::ostringstream job;
-    job << "set -u\ncd \"$(dirname \"$0\")\"\npids=()\n";
+    job << "set -u\ncd \"$(dirname \"$0\")\"\npids=()\n" << plan.beforeGadgets << "\n";
     for (size_t i = 0; i < gadgets.size(); ++i) {
-        job << quoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << quoted(scenarioFile) << " --device "
+        job << quoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << quoted(plan.scenarioFile) << " --device "
             << quoted(gadgets[i].device) << " --udc dummy_udc." << i << " --name device" << i;
         if (!gadgets[i].serial.empty()) job << " --serial " << quoted(gadgets[i].serial);
         job << " --report gadget-" << i << ".json --ready ready-" << i << " 2>gadget-" << i << ".err &\n";
@@ -76,6 +76,7 @@ std::string jobScript(const std::string& scenarioFile, const std::vector<GadgetP
         << "udevadm settle --timeout=20\n"
         << usbCommand << " >usb.out 2>usb.err\n"
         << "echo $? >usb.exit\n"
+        << plan.afterUsb << "\n"
         << "kill -TERM \"${pids[@]}\"\n"
         << "wait\n";
     return job.str();
@@ -113,9 +114,10 @@ std::string GuestMachine::prepare()
     return verdict;
 }
 
-GuestRun GuestMachine::run(const std::string& jobName, const std::string& scenarioFile,
-                           const std::vector<GadgetPlan>& gadgets, const std::vector<std::string>& usbArguments)
+GuestRun GuestMachine::run(const std::string& jobName, const GuestJob& job)
 {
+    const std::string& scenarioFile = job.scenarioFile;
+    const std::vector<GadgetPlan>& gadgets = job.gadgets;
     fs::path folder = fs::path(MORVANEK_BINARY_DIR) / "usbKernel" / jobName;
     fs::remove_all(folder);
     fs::create_directories(folder);
@@ -125,15 +127,17 @@ GuestRun GuestMachine::run(const std::string& jobName, const std::string& scenar
     if (exported.exitCode != 0) throw std::runtime_error("the lab could not export " + scenarioFile);
     std::string worldArguments = exported.out.substr(0, exported.out.find('\n'));
 
-    std::string usbCommand = quoted(MORVANEK_USB_EXECUTABLE) + " once --json --no-progress " + worldArguments;
-    for (const std::string& argument : usbArguments) usbCommand += " " + quoted(argument);
-    std::ofstream(folder / "job.sh") << jobScript(scenarioFile, gadgets, usbCommand);
+    std::string usbCommand =
+        job.usbPrefix + " " + quoted(MORVANEK_USB_EXECUTABLE) + " once --json --no-progress " + worldArguments;
+    for (const std::string& argument : job.usbArguments) usbCommand += " " + quoted(argument);
+    std::ofstream(folder / "job.sh") << jobScript(job, usbCommand);
 
     CommandResult guest = runCommand(quoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/runGuest") + " " +
                                      quoted(guestFolder()) + " " + quoted(folder.string()) + " " +
                                      quoted((folder / "job.sh").string()) + " " + std::to_string(gadgets.size()) +
                                      " 2>&1");
     GuestRun run;
+    run.folder = folder.string();
     run.log = guest.out + readText(folder / "job.log") + readText(folder / "usb.err");
     for (size_t i = 0; i < gadgets.size(); ++i) run.log += readText(folder / ("gadget-" + std::to_string(i) + ".err"));
     if (guest.exitCode != 0) throw std::runtime_error("the guest did not run the job:\n" + run.log);

@@ -17,12 +17,24 @@ struct GadgetPlan {
     std::string serial;  // its USB serial-number string
 };
 
+// What the guest does: serve the gadgets, run morvanek-usb once with the
+// scenario's world and the extra arguments.
+struct GuestJob {
+    std::string scenarioFile;
+    std::vector<GadgetPlan> gadgets;
+    std::vector<std::string> usbArguments;
+    std::string usbPrefix;      // a command morvanek-usb runs under, such as one that drops root
+    std::string beforeGadgets;  // shell lines run before the gadgets start
+    std::string afterUsb;       // shell lines run after morvanek-usb ended, before the gadgets stop
+};
+
 struct GuestRun {
     int usbExitCode = -1;
     std::vector<nlohmann::json> events;  // morvanek-usb's JSON lines
     std::string usbErrors;
     std::map<std::string, nlohmann::json> gadgets;  // each device's gadget report, by device name
     std::string log;                                // what the job and the guest said, for failures
+    std::string folder;                             // the job's folder, with what it wrote
 
     std::vector<nlohmann::json> eventsOf(const std::string& kind) const;
     // The update events of loader-mode devices (a product that arrives is "ignored").
@@ -38,8 +50,7 @@ class GuestMachine {
     // Exports the scenario's world with the lab, boots the guest with one
     // controller per gadget, serves the devices and runs `morvanek-usb once`
     // with the world and the extra arguments.
-    static GuestRun run(const std::string& jobName, const std::string& scenarioFile,
-                        const std::vector<GadgetPlan>& gadgets, const std::vector<std::string>& usbArguments = {});
+    static GuestRun run(const std::string& jobName, const GuestJob& job);
 
     // The lab's own run of the scenario: each device's trace, by device name.
     static std::map<std::string, nlohmann::json> labTraces(const std::string& scenarioFile);

@@ -6,6 +6,8 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <fstream>
+#include <iterator>
 
 #include "guestMachine.h"
 
@@ -13,6 +15,17 @@ namespace usb_kernel_testing {
 namespace {
 
 const std::string kScenarios = std::string(MORVANEK_SOURCE_DIR) + "/tests/usbKernel/scenarios/";
+std::string quoted(const std::string& text)
+{
+    return "'" + text + "'";
+}
+
+std::string readFile(const std::string& path)
+{
+    std::ifstream in(path);
+    return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+}
+
 const std::string kLabScenarios = std::string(MORVANEK_SOURCE_DIR) + "/morvanek-lab/scenarios/";
 
 class KernelUsb : public testing::Test {
@@ -64,7 +77,7 @@ TEST_P(KernelUsbUpdate, ProgramsTheDeviceAndSeesItComeBackAsTheProduct)
 {
     const UpdateCase& param = GetParam();
     std::string scenario = kLabScenarios + param.scenario;
-    GuestRun run = GuestMachine::run(jobName(), scenario, {{param.device, "MV0001"}});
+    GuestRun run = GuestMachine::run(jobName(), {scenario, {{param.device, "MV0001"}}});
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     ASSERT_EQ(run.updates().size(), 1u) << run.log;
@@ -102,7 +115,7 @@ TEST_P(KernelUsbFault, FailsTheUpdateAndLeavesTheDeviceInItsLoader)
 {
     const FaultCase& param = GetParam();
     std::string scenario = kScenarios + "faults-while-programming.json";
-    GuestRun run = GuestMachine::run(jobName(), scenario, {{param.device, ""}});
+    GuestRun run = GuestMachine::run(jobName(), {scenario, {{param.device, ""}}});
 
     EXPECT_EQ(run.usbExitCode, 1) << run.log;
     ASSERT_EQ(run.updates().size(), 1u) << run.log;
@@ -130,7 +143,7 @@ INSTANTIATE_TEST_SUITE_P(WhileProgramming, KernelUsbFault,
 TEST_F(KernelUsb, UpdatesTwoDevicesOfOneProductAtOnce)
 {
     std::string scenario = kScenarios + "two-of-one-product.json";
-    GuestRun run = GuestMachine::run(jobName(), scenario, {{"left", "MV0111"}, {"right", "MV0222"}});
+    GuestRun run = GuestMachine::run(jobName(), {scenario, {{"left", "MV0111"}, {"right", "MV0222"}}});
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     auto updates = run.updates();
@@ -148,7 +161,7 @@ TEST_F(KernelUsb, UpdatesOnlyTheDeviceWithTheSerialNumberGiven)
 {
     std::string scenario = kScenarios + "two-of-one-product.json";
     GuestRun run =
-        GuestMachine::run(jobName(), scenario, {{"left", "MV0111"}, {"right", "MV0222"}}, {"--serial", "MV0222"});
+        GuestMachine::run(jobName(), {scenario, {{"left", "MV0111"}, {"right", "MV0222"}}, {"--serial", "MV0222"}});
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     auto updates = run.updates();
@@ -159,6 +172,35 @@ TEST_F(KernelUsb, UpdatesOnlyTheDeviceWithTheSerialNumberGiven)
     EXPECT_EQ(run.gadgets.at("right")["mode"], "product");
     std::map<std::string, nlohmann::json> lab = GuestMachine::labTraces(scenario);
     EXPECT_EQ(traceDifference(lab["right"], run.gadgets.at("right")["trace"]), "") << run.log;
+}
+
+// Without root and without the udev rule the device node cannot be opened:
+// the program says which rule to install, updates nothing and leaves the
+// device as it was. The rule, installed, tags the loader for the logged-in
+// user's access.
+TEST_F(KernelUsb, WithoutAccessToTheDeviceNodeNamesTheRuleThatGivesIt)
+{
+    GuestJob job;
+    job.scenarioFile = kScenarios + "two-of-one-product.json";
+    job.gadgets = {{"left", "MV0111"}};
+    job.beforeGadgets = "mkdir -p /run/udev/rules.d && cp " + quoted(std::string(MORVANEK_SOURCE_DIR) +
+                                                                     "/usb/udev/70-morvanek.rules") +
+                        " /run/udev/rules.d/ && udevadm control --reload";
+    job.usbPrefix = "setpriv --reuid=65534 --regid=65534 --clear-groups";
+    job.afterUsb = "for node in /sys/bus/usb/devices/*/idVendor; do udevadm info -q property \"${node%/idVendor}\"; "
+                   "done >udev-properties";
+    GuestRun run = GuestMachine::run(jobName(), job);
+
+    EXPECT_EQ(run.usbExitCode, 1) << run.log;
+    ASSERT_EQ(run.eventsOf("problem").size(), 1u) << run.log;
+    EXPECT_NE(run.eventsOf("problem")[0].value("text", "").find("Install the udev rule 70-morvanek.rules"),
+              std::string::npos);
+    ASSERT_EQ(run.updates().size(), 1u) << run.log;
+    EXPECT_EQ(run.updates()[0]["firstFailure"], -53006);
+    EXPECT_EQ(run.gadgets.at("left")["trace"], nlohmann::json::array());
+    std::string properties = readFile(run.folder + "/udev-properties");
+    EXPECT_NE(properties.find("ID_MODEL_ID=4a10"), std::string::npos) << properties;
+    EXPECT_NE(properties.find("uaccess"), std::string::npos) << properties;
 }
 
 }  // namespace
