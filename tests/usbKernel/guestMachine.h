@@ -6,6 +6,7 @@
 
 #include <map>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <nlohmann/json.hpp>
@@ -20,6 +21,12 @@ struct GadgetPlan {
 // What the guest does: serve the gadgets, run morvanek-usb once with the
 // scenario's world and the extra arguments.
 struct GuestJob {
+    GuestJob() = default;
+    GuestJob(std::string scenario, std::vector<GadgetPlan> served, std::vector<std::string> arguments = {})
+        : scenarioFile(std::move(scenario)), gadgets(std::move(served)), usbArguments(std::move(arguments))
+    {
+    }
+
     std::string scenarioFile;
     std::vector<GadgetPlan> gadgets;
     std::vector<std::string> usbArguments;

@@ -77,7 +77,7 @@ TEST_P(KernelUsbUpdate, ProgramsTheDeviceAndSeesItComeBackAsTheProduct)
 {
     const UpdateCase& param = GetParam();
     std::string scenario = kLabScenarios + param.scenario;
-    GuestRun run = GuestMachine::run(jobName(), {scenario, {{param.device, "MV0001"}}});
+    GuestRun run = GuestMachine::run(jobName(), GuestJob(scenario, {{param.device, "MV0001"}}));
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     ASSERT_EQ(run.updates().size(), 1u) << run.log;
@@ -115,7 +115,7 @@ TEST_P(KernelUsbFault, FailsTheUpdateAndLeavesTheDeviceInItsLoader)
 {
     const FaultCase& param = GetParam();
     std::string scenario = kScenarios + "faults-while-programming.json";
-    GuestRun run = GuestMachine::run(jobName(), {scenario, {{param.device, ""}}});
+    GuestRun run = GuestMachine::run(jobName(), GuestJob(scenario, {{param.device, ""}}));
 
     EXPECT_EQ(run.usbExitCode, 1) << run.log;
     ASSERT_EQ(run.updates().size(), 1u) << run.log;
@@ -143,7 +143,7 @@ INSTANTIATE_TEST_SUITE_P(WhileProgramming, KernelUsbFault,
 TEST_F(KernelUsb, UpdatesTwoDevicesOfOneProductAtOnce)
 {
     std::string scenario = kScenarios + "two-of-one-product.json";
-    GuestRun run = GuestMachine::run(jobName(), {scenario, {{"left", "MV0111"}, {"right", "MV0222"}}});
+    GuestRun run = GuestMachine::run(jobName(), GuestJob(scenario, {{"left", "MV0111"}, {"right", "MV0222"}}));
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     auto updates = run.updates();
@@ -161,7 +161,7 @@ TEST_F(KernelUsb, UpdatesOnlyTheDeviceWithTheSerialNumberGiven)
 {
     std::string scenario = kScenarios + "two-of-one-product.json";
     GuestRun run =
-        GuestMachine::run(jobName(), {scenario, {{"left", "MV0111"}, {"right", "MV0222"}}, {"--serial", "MV0222"}});
+        GuestMachine::run(jobName(), GuestJob(scenario, {{"left", "MV0111"}, {"right", "MV0222"}}, {"--serial", "MV0222"}));
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     auto updates = run.updates();
