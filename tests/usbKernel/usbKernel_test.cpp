@@ -55,6 +55,20 @@ class KernelUsb : public testing::Test {
         }
     }
 
+    // Every transfer the module made reached the device, and only those: the
+    // updates' request counts (by USB serial number) are the device's traces.
+    static void expectEveryTransferReachedTheDevice(const GuestRun& run, const std::vector<GadgetPlan>& gadgets)
+    {
+        for (const GadgetPlan& gadget : gadgets) {
+            size_t made = 0;
+            for (const auto& update : run.updates()) {
+                if (gadgets.size() == 1 || update["device"].value("serial", "") == gadget.serial)
+                    made += update.value("requests", size_t{0});
+            }
+            EXPECT_EQ(made, run.gadgets.at(gadget.device)["trace"].size()) << gadget.device << "\n" << run.log;
+        }
+    }
+
     static std::vector<std::string> bus(const GuestRun& run, const std::string& device)
     {
         return run.gadgets.at(device)["bus"].get<std::vector<std::string>>();
@@ -91,6 +105,7 @@ TEST_P(KernelUsbUpdate, ProgramsTheDeviceAndSeesItComeBackAsTheProduct)
     EXPECT_EQ(gadget["markerInPlace"], true);
     EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"], nlohmann::json::array());
     expectLabTraces(scenario, run);
+    expectEveryTransferReachedTheDevice(run, {{param.device, "MV0001"}});
 }
 
 INSTANTIATE_TEST_SUITE_P(BothLoaders, KernelUsbUpdate,
@@ -129,6 +144,7 @@ TEST_P(KernelUsbFault, FailsTheUpdateAndLeavesTheDeviceInItsLoader)
     EXPECT_EQ(bus(run, param.device), expectedBus);
     EXPECT_EQ(gadget["notes"].size(), param.staysOnTheBus ? 0u : 1u) << gadget["notes"].dump();
     expectLabTraces(scenario, run);
+    expectEveryTransferReachedTheDevice(run, {{param.device, ""}});
 }
 
 INSTANTIATE_TEST_SUITE_P(WhileProgramming, KernelUsbFault,
@@ -143,7 +159,8 @@ INSTANTIATE_TEST_SUITE_P(WhileProgramming, KernelUsbFault,
 TEST_F(KernelUsb, UpdatesTwoDevicesOfOneProductAtOnce)
 {
     std::string scenario = kScenarios + "two-of-one-product.json";
-    GuestRun run = GuestMachine::run(jobName(), GuestJob(scenario, {{"left", "MV0111"}, {"right", "MV0222"}}));
+    std::vector<GadgetPlan> gadgets = {{"left", "MV0111"}, {"right", "MV0222"}};
+    GuestRun run = GuestMachine::run(jobName(), GuestJob(scenario, gadgets));
 
     EXPECT_EQ(run.usbExitCode, 0) << run.log;
     auto updates = run.updates();
@@ -154,6 +171,7 @@ TEST_F(KernelUsb, UpdatesTwoDevicesOfOneProductAtOnce)
         EXPECT_EQ(bus(run, device).back(), "connected 5C1D:4B01") << device;
     }
     expectLabTraces(scenario, run);
+    expectEveryTransferReachedTheDevice(run, gadgets);
 }
 
 // Selection by USB serial number: only the device named is asked anything.
