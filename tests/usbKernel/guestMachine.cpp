@@ -54,31 +54,48 @@ std::string guestFolder()
 
 // The job the guest runs: the gadgets, then morvanek-usb once the devices
 // have enumerated, then the gadgets stopped so they write their reports.
+// The gadgets of the job, started in the background.
+std::string gadgetLines(const GuestJob& plan)
+{
+    std::ostringstream lines;
+    for (size_t i = 0; i < plan.gadgets.size(); ++i) {
+        lines << quoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << quoted(plan.scenarioFile) << " --device "
+              << quoted(plan.gadgets[i].device) << " --udc dummy_udc." << i << " --name device" << i;
+        if (!plan.gadgets[i].serial.empty()) lines << " --serial " << quoted(plan.gadgets[i].serial);
+        lines << " --report gadget-" << i << ".json --ready ready-" << i << " 2>gadget-" << i << ".err &\n";
+        lines << "gadgets+=($!)\n";
+    }
+    return lines.str();
+}
+
+// Waits up to `seconds` for a shell condition.
+std::string waitFor(const std::string& condition, int seconds)
+{
+    return "for i in $(seq " + std::to_string(seconds * 10) + "); do " + condition + " && break; sleep 0.1; done\n";
+}
+
+// once: the gadgets, then morvanek-usb once the devices have enumerated.
+// watch: morvanek-usb first, then the gadgets arrive; it is stopped with
+// SIGTERM once every device came back after its restart. Then the gadgets
+// are stopped, so that they write their reports.
 std::string jobScript(const GuestJob& plan, const std::string& usbCommand)
 {
-    const std::vector<GadgetPlan>& gadgets = plan.gadgets;
+    std::string count = std::to_string(plan.gadgets.size());
     std::ostringstream job;
-    job << "set -u\ncd \"$(dirname \"$0\")\"\npids=()\n" << plan.beforeGadgets << "\n";
-    for (size_t i = 0; i < gadgets.size(); ++i) {
-        job << quoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << quoted(plan.scenarioFile) << " --device "
-            << quoted(gadgets[i].device) << " --udc dummy_udc." << i << " --name device" << i;
-        if (!gadgets[i].serial.empty()) job << " --serial " << quoted(gadgets[i].serial);
-        job << " --report gadget-" << i << ".json --ready ready-" << i << " 2>gadget-" << i << ".err &\n";
-        job << "pids+=($!)\n";
+    job << "set -u\ncd \"$(dirname \"$0\")\"\ngadgets=()\n" << plan.beforeGadgets << "\n";
+    if (plan.watch) {
+        job << usbCommand << " >usb.out 2>usb.err &\nusb=$!\nsleep 1\n" << gadgetLines(plan)
+            << waitFor("[ \"$(grep -c 'back after its restart' usb.out)\" -ge " + count + " ]", 60)
+            << "kill -TERM $usb\nwait $usb\necho $? >usb.exit\n";
+    } else {
+        job << gadgetLines(plan)
+            << waitFor("[ \"$(ls ready-* 2>/dev/null | wc -l)\" -eq " + count + " ] && [ \"$(grep -l '^5c1d$' "
+                       "/sys/bus/usb/devices/*/idVendor 2>/dev/null | wc -l)\" -eq " + count + " ]",
+                       20)
+            << "udevadm settle --timeout=20\n"
+            << usbCommand << " >usb.out 2>usb.err\necho $? >usb.exit\n";
     }
-    job << "for i in $(seq 200); do\n"
-        << "  ready=$(ls ready-* 2>/dev/null | wc -l)\n"
-        << "  devices=$(grep -l '^5c1d$' /sys/bus/usb/devices/*/idVendor 2>/dev/null | wc -l)\n"
-        << "  [ \"$ready\" -eq " << gadgets.size() << " ] && [ \"$devices\" -eq " << gadgets.size()
-        << " ] && break\n"
-        << "  sleep 0.1\n"
-        << "done\n"
-        << "udevadm settle --timeout=20\n"
-        << usbCommand << " >usb.out 2>usb.err\n"
-        << "echo $? >usb.exit\n"
-        << plan.afterUsb << "\n"
-        << "kill -TERM \"${pids[@]}\"\n"
-        << "wait\n";
+    job << plan.afterUsb << "\nkill -TERM \"${gadgets[@]}\"\nwait\n";
     return job.str();
 }
 
@@ -128,7 +145,8 @@ GuestRun GuestMachine::run(const std::string& jobName, const GuestJob& job)
     std::string worldArguments = exported.out.substr(0, exported.out.find('\n'));
 
     std::string usbCommand =
-        job.usbPrefix + " " + quoted(MORVANEK_USB_EXECUTABLE) + " once --json --no-progress " + worldArguments;
+        job.usbPrefix + " " + quoted(MORVANEK_USB_EXECUTABLE) + (job.watch ? " watch" : " once") +
+        " --json --no-progress " + worldArguments;
     for (const std::string& argument : job.usbArguments) usbCommand += " " + quoted(argument);
     std::ofstream(folder / "job.sh") << jobScript(job, usbCommand);
 

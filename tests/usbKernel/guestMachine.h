@@ -18,8 +18,8 @@ struct GadgetPlan {
     std::string serial;  // its USB serial-number string
 };
 
-// What the guest does: serve the gadgets, run morvanek-usb once with the
-// scenario's world and the extra arguments.
+// What the guest does: serve the gadgets, run morvanek-usb once (or watch)
+// with the scenario's world and the extra arguments.
 struct GuestJob {
     GuestJob() = default;
     GuestJob(std::string scenario, std::vector<GadgetPlan> served, std::vector<std::string> arguments = {})
@@ -33,6 +33,7 @@ struct GuestJob {
     std::string usbPrefix;      // a command morvanek-usb runs under, such as one that drops root
     std::string beforeGadgets;  // shell lines run before the gadgets start
     std::string afterUsb;       // shell lines run after morvanek-usb ended, before the gadgets stop
+    bool watch = false;         // morvanek-usb watch, started before the devices arrive
 };
 
 struct GuestRun {

@@ -192,6 +192,28 @@ TEST_F(KernelUsb, UpdatesOnlyTheDeviceWithTheSerialNumberGiven)
     EXPECT_EQ(traceDifference(lab["right"], run.gadgets.at("right")["trace"]), "") << run.log;
 }
 
+// watch on the real stack: devices that arrive after the start are seen
+// through udev's hotplug events, updated side by side, seen coming back as
+// the product, and SIGTERM stops the program cleanly.
+TEST_F(KernelUsb, WatchUpdatesDevicesThatArriveAndStopsOnSigterm)
+{
+    std::string scenario = kScenarios + "two-of-one-product.json";
+    GuestJob job(scenario, {{"left", "MV0111"}, {"right", "MV0222"}});
+    job.watch = true;
+    GuestRun run = GuestMachine::run(jobName(), job);
+
+    EXPECT_EQ(run.usbExitCode, 0) << run.log;
+    auto updates = run.updates();
+    ASSERT_EQ(updates.size(), 2u) << run.log;
+    for (const auto& update : updates) EXPECT_EQ(update["outcome"], "updated") << update.dump();
+    auto arrivals = run.eventsOf("arrived");
+    EXPECT_EQ(std::count_if(arrivals.begin(), arrivals.end(), [](const auto& e) { return e["text"] == "arrived"; }), 2)
+        << run.log;
+    EXPECT_EQ(run.eventsOf("summary").at(0)["leftovers"], nlohmann::json::array());
+    expectLabTraces(scenario, run);
+    expectEveryTransferReachedTheDevice(run, job.gadgets);
+}
+
 // Without root and without the udev rule the device node cannot be opened:
 // the program says which rule to install, updates nothing and leaves the
 // device as it was. The rule, installed, tags the loader for the logged-in
