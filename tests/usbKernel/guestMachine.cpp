@@ -174,15 +174,24 @@ GuestRun GuestMachine::run(const std::string& jobName, const GuestJob& job)
     return run;
 }
 
-std::map<std::string, nlohmann::json> GuestMachine::labTraces(const std::string& scenarioFile)
+std::map<std::string, nlohmann::json> GuestMachine::labDevices(const std::string& scenarioFile)
 {
     CommandResult lab =
         runCommand(quoted(MORVANEK_LAB_EXECUTABLE) + " run --trace --json " + quoted(scenarioFile) + " 2>/dev/null");
     nlohmann::json report = nlohmann::json::parse(lab.out, nullptr, false);
     std::map<std::string, nlohmann::json> traces;
     if (report.is_discarded()) return traces;
-    for (const auto& device : report["scenarios"][0]["devices"]) traces[device["name"]] = device["trace"];
+    for (const auto& device : report["scenarios"][0]["devices"]) traces[device["name"]] = device;
     return traces;
+}
+
+std::vector<std::string> GuestMachine::deviceNames(const std::string& scenarioFile)
+{
+    nlohmann::json scenario = nlohmann::json::parse(readText(scenarioFile), nullptr, false);
+    std::vector<std::string> names;
+    if (scenario.is_discarded()) return names;
+    for (const auto& device : scenario.value("devices", nlohmann::json::array())) names.push_back(device["name"]);
+    return names;
 }
 
 std::string traceDifference(const nlohmann::json& expected, const nlohmann::json& seen)

@@ -60,8 +60,11 @@ class GuestMachine {
     // with the world and the extra arguments.
     static GuestRun run(const std::string& jobName, const GuestJob& job);
 
-    // The lab's own run of the scenario: each device's trace, by device name.
-    static std::map<std::string, nlohmann::json> labTraces(const std::string& scenarioFile);
+    // The lab's own run of the scenario: each device's report (its trace,
+    // mode, marker, ...) by device name.
+    static std::map<std::string, nlohmann::json> labDevices(const std::string& scenarioFile);
+    // The scenario's device names, in order.
+    static std::vector<std::string> deviceNames(const std::string& scenarioFile);
 };
 
 // The first difference between two traces (the lab's JSON form), or empty
