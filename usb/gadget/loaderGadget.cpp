@@ -130,7 +130,11 @@ void LoaderGadget::serve(int stopFd)
             comebackDue_ = false;
             connect();
         }
-        if ((watched[0].revents & POLLIN) == 0) continue;
+        if ((watched[0].revents & POLLIN) == 0) {
+            if ((watched[0].revents & (POLLERR | POLLHUP | POLLNVAL)) != 0)
+                throw std::runtime_error("FunctionFS closed the control endpoint");
+            continue;
+        }
         FunctionFsEndpoint::Event event = endpoint_->next();
         if (event.kind != FunctionFsEndpoint::EventKind::setup) continue;
         if (enumeration_ != nullptr) {
