@@ -14,13 +14,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-std::string quoted(const std::string& text)
-{
-    std::string out = "'";
-    for (char c : text) out += c == '\'' ? std::string("'\\''") : std::string(1, c);
-    return out + "'";
-}
-
 struct CommandResult {
     int exitCode = -1;
     std::string out;
@@ -59,9 +52,9 @@ std::string gadgetLines(const GuestJob& plan)
 {
     std::ostringstream lines;
     for (size_t i = 0; i < plan.gadgets.size(); ++i) {
-        lines << quoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << quoted(plan.scenarioFile) << " --device "
-              << quoted(plan.gadgets[i].device) << " --udc dummy_udc." << i << " --name device" << i;
-        if (!plan.gadgets[i].serial.empty()) lines << " --serial " << quoted(plan.gadgets[i].serial);
+        lines << shellQuoted(MORVANEK_USB_GADGET_EXECUTABLE) << " " << shellQuoted(plan.scenarioFile) << " --device "
+              << shellQuoted(plan.gadgets[i].device) << " --udc dummy_udc." << i << " --name device" << i;
+        if (!plan.gadgets[i].serial.empty()) lines << " --serial " << shellQuoted(plan.gadgets[i].serial);
         lines << " --report gadget-" << i << ".json --ready ready-" << i << " 2>gadget-" << i << ".err &\n";
         lines << "gadgets+=($!)\n";
     }
@@ -101,6 +94,13 @@ std::string jobScript(const GuestJob& plan, const std::string& usbCommand)
 
 }  // namespace
 
+std::string shellQuoted(const std::string& text)
+{
+    std::string out = "'";
+    for (char c : text) out += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    return out + "'";
+}
+
 std::vector<nlohmann::json> GuestRun::eventsOf(const std::string& kind) const
 {
     std::vector<nlohmann::json> found;
@@ -108,6 +108,11 @@ std::vector<nlohmann::json> GuestRun::eventsOf(const std::string& kind) const
         if (event.value("event", "") == kind) found.push_back(event);
     }
     return found;
+}
+
+std::string GuestRun::file(const std::string& name) const
+{
+    return readText(fs::path(folder) / name);
 }
 
 std::vector<nlohmann::json> GuestRun::updates() const
@@ -122,8 +127,8 @@ std::vector<nlohmann::json> GuestRun::updates() const
 std::string GuestMachine::prepare()
 {
     static const std::string verdict = [] {
-        CommandResult prepared = runCommand(quoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/prepareGuest") + " " +
-                                            quoted(guestFolder()) + " 2>&1");
+        CommandResult prepared = runCommand(shellQuoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/prepareGuest") + " " +
+                                            shellQuoted(guestFolder()) + " 2>&1");
         if (prepared.exitCode == 0) return std::string();
         if (prepared.exitCode == 77) return prepared.out.empty() ? std::string("skipped") : prepared.out;
         throw std::runtime_error("the guest could not be prepared: " + prepared.out);
@@ -139,20 +144,20 @@ GuestRun GuestMachine::run(const std::string& jobName, const GuestJob& job)
     fs::remove_all(folder);
     fs::create_directories(folder);
 
-    CommandResult exported = runCommand(quoted(MORVANEK_LAB_EXECUTABLE) + " export " + quoted(scenarioFile) + " " +
-                                        quoted((folder / "world").string()) + " 2>/dev/null");
+    CommandResult exported = runCommand(shellQuoted(MORVANEK_LAB_EXECUTABLE) + " export " + shellQuoted(scenarioFile) + " " +
+                                        shellQuoted((folder / "world").string()) + " 2>/dev/null");
     if (exported.exitCode != 0) throw std::runtime_error("the lab could not export " + scenarioFile);
     std::string worldArguments = exported.out.substr(0, exported.out.find('\n'));
 
     std::string usbCommand =
-        job.usbPrefix + " " + quoted(MORVANEK_USB_EXECUTABLE) + (job.watch ? " watch" : " once") +
+        job.usbPrefix + " " + shellQuoted(MORVANEK_USB_EXECUTABLE) + (job.watch ? " watch" : " once") +
         " --json --no-progress " + worldArguments;
-    for (const std::string& argument : job.usbArguments) usbCommand += " " + quoted(argument);
+    for (const std::string& argument : job.usbArguments) usbCommand += " " + shellQuoted(argument);
     std::ofstream(folder / "job.sh") << jobScript(job, usbCommand);
 
-    CommandResult guest = runCommand(quoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/runGuest") + " " +
-                                     quoted(guestFolder()) + " " + quoted(folder.string()) + " " +
-                                     quoted((folder / "job.sh").string()) + " " + std::to_string(gadgets.size()) +
+    CommandResult guest = runCommand(shellQuoted(std::string(MORVANEK_GUEST_SCRIPTS) + "/runGuest") + " " +
+                                     shellQuoted(guestFolder()) + " " + shellQuoted(folder.string()) + " " +
+                                     shellQuoted((folder / "job.sh").string()) + " " + std::to_string(gadgets.size()) +
                                      " 2>&1");
     GuestRun run;
     run.folder = folder.string();
@@ -177,7 +182,7 @@ GuestRun GuestMachine::run(const std::string& jobName, const GuestJob& job)
 std::map<std::string, nlohmann::json> GuestMachine::labDevices(const std::string& scenarioFile)
 {
     CommandResult lab =
-        runCommand(quoted(MORVANEK_LAB_EXECUTABLE) + " run --trace --json " + quoted(scenarioFile) + " 2>/dev/null");
+        runCommand(shellQuoted(MORVANEK_LAB_EXECUTABLE) + " run --trace --json " + shellQuoted(scenarioFile) + " 2>/dev/null");
     nlohmann::json report = nlohmann::json::parse(lab.out, nullptr, false);
     std::map<std::string, nlohmann::json> traces;
     if (report.is_discarded()) return traces;

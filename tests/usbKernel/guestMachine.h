@@ -45,6 +45,8 @@ struct GuestRun {
     std::string folder;                             // the job's folder, with what it wrote
 
     std::vector<nlohmann::json> eventsOf(const std::string& kind) const;
+    // A file the job wrote into its folder; empty when there is none.
+    std::string file(const std::string& name) const;
     // The update events of loader-mode devices (a product that arrives is "ignored").
     std::vector<nlohmann::json> updates() const;
 };
@@ -66,6 +68,9 @@ class GuestMachine {
     // The scenario's device names, in order.
     static std::vector<std::string> deviceNames(const std::string& scenarioFile);
 };
+
+// The text as one word for the shell.
+std::string shellQuoted(const std::string& text);
 
 // The first difference between two traces (the lab's JSON form), or empty
 // when they agree request for request: kind, addresses, length, outcome, data.

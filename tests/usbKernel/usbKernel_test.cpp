@@ -7,8 +7,6 @@
 
 #include <algorithm>
 #include <cctype>
-#include <fstream>
-#include <iterator>
 
 #include "guestMachine.h"
 
@@ -16,17 +14,6 @@ namespace usb_kernel_testing {
 namespace {
 
 const std::string kScenarios = std::string(MORVANEK_SOURCE_DIR) + "/tests/usbKernel/scenarios/";
-std::string quoted(const std::string& text)
-{
-    return "'" + text + "'";
-}
-
-std::string readFile(const std::string& path)
-{
-    std::ifstream in(path);
-    return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-}
-
 const std::string kLabScenarios = std::string(MORVANEK_SOURCE_DIR) + "/morvanek-lab/scenarios/";
 
 class KernelUsb : public testing::Test {
@@ -292,7 +279,7 @@ TEST_F(KernelUsb, WithoutAccessToTheDeviceNodeNamesTheRuleThatGivesIt)
     GuestJob job;
     job.scenarioFile = kScenarios + "two-of-one-product.json";
     job.gadgets = {{"left", "MV0111"}};
-    job.beforeGadgets = "mkdir -p /run/udev/rules.d && cp " + quoted(std::string(MORVANEK_SOURCE_DIR) +
+    job.beforeGadgets = "mkdir -p /run/udev/rules.d && cp " + shellQuoted(std::string(MORVANEK_SOURCE_DIR) +
                                                                      "/usb/udev/70-morvanek.rules") +
                         " /run/udev/rules.d/ && udevadm control --reload";
     job.usbPrefix = "setpriv --reuid=65534 --regid=65534 --clear-groups";
@@ -307,7 +294,7 @@ TEST_F(KernelUsb, WithoutAccessToTheDeviceNodeNamesTheRuleThatGivesIt)
     ASSERT_EQ(run.updates().size(), 1u) << run.log;
     EXPECT_EQ(run.updates()[0]["firstFailure"], -53006);
     EXPECT_EQ(run.gadgets.at("left")["trace"], nlohmann::json::array());
-    std::string properties = readFile(run.folder + "/udev-properties");
+    std::string properties = run.file("udev-properties");
     EXPECT_NE(properties.find("ID_MODEL_ID=4a10"), std::string::npos) << properties;
     EXPECT_NE(properties.find("uaccess"), std::string::npos) << properties;
 }

@@ -1,6 +1,7 @@
 #include "loaderControlRequest.h"
 
 #include <cerrno>
+#include <cstdio>
 
 #include "sim/device/enumeratedDevice.h"
 
@@ -62,6 +63,13 @@ ControlOutcome serveVendorRequest(sim::PhysicalDevice& hardware, const sim::Enum
         crossed = hardware.trace.back().data.size();
     result.actualLength = static_cast<int>(crossed);
     return result;
+}
+
+std::string idText(uint16_t vendorId, uint16_t productId)
+{
+    char text[16];
+    std::snprintf(text, sizeof text, "%04X:%04X", vendorId, productId);
+    return text;
 }
 
 uint16_t vendorIdOf(sim::EnumeratedDevice& enumeration)

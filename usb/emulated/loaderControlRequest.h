@@ -6,6 +6,7 @@
 #include <chrono>
 #include <cstdint>
 #include <functional>
+#include <string>
 
 #include "sim/device/physicalDevice.h"
 
@@ -40,5 +41,7 @@ ControlOutcome serveVendorRequest(sim::PhysicalDevice& hardware, const sim::Enum
 // The vendor and product ID an enumeration shows in its device descriptor.
 uint16_t vendorIdOf(sim::EnumeratedDevice& enumeration);
 uint16_t productIdOf(sim::EnumeratedDevice& enumeration);
+// "5C1D:4A10", as the buses' histories name an enumeration.
+std::string idText(uint16_t vendorId, uint16_t productId);
 
 }  // namespace usbemulated

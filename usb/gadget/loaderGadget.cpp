@@ -13,17 +13,6 @@
 
 namespace usbgadget {
 
-namespace {
-
-std::string idText(uint16_t vendorId, uint16_t productId)
-{
-    char text[16];
-    std::snprintf(text, sizeof text, "%04X:%04X", vendorId, productId);
-    return text;
-}
-
-}  // namespace
-
 LoaderGadget::LoaderGadget(std::shared_ptr<sim::PhysicalDevice> hardware, sim::PhysicalDevice::PowerUp startsIn,
                            GadgetSettings settings)
     : hardware_(std::move(hardware)), settings_(std::move(settings))
@@ -60,7 +49,7 @@ void LoaderGadget::connect()
     gadget_->setIds(vendorId, productId);
     gadget_->bind(settings_.udc);
     enumeration_ = now;
-    history_.push_back("connected " + idText(vendorId, productId));
+    history_.push_back("connected " + usbemulated::idText(vendorId, productId));
 }
 
 void LoaderGadget::leaveBus(bool comesBack)

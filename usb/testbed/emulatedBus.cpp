@@ -7,6 +7,7 @@
 #include <stdexcept>
 
 #include "busNode.h"
+#include "usb/emulated/loaderControlRequest.h"
 
 namespace usbtestbed {
 
@@ -15,13 +16,6 @@ namespace {
 // the bus, and how long a restarted device takes to enumerate again.
 constexpr int kReportDelayMs = 5;
 constexpr int kComebackDelayMs = 40;
-
-std::string idText(uint16_t vendorId, uint16_t productId)
-{
-    char text[16];
-    std::snprintf(text, sizeof text, "%04X:%04X", vendorId, productId);
-    return text;
-}
 }  // namespace
 
 EmulatedBus::EmulatedBus(double scale) : timeScale(scale), testbed_(umockdev_testbed_new())
@@ -101,7 +95,7 @@ void EmulatedBus::addNode(const std::string& busPath, std::shared_ptr<sim::Physi
         g_clear_error(&error);
         throw std::runtime_error("umockdev cannot add " + busPath + ": " + what);
     }
-    history_.push_back("add " + busPath + " " + idText(node->vendorId(), node->productId()));
+    history_.push_back("add " + busPath + " " + usbemulated::idText(node->vendorId(), node->productId()));
     nodes_[busPath] = std::move(node);
 }
 
